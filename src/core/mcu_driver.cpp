@@ -1,0 +1,162 @@
+// Scan geometry and the band (MCU-row) driver: reads one band through the
+// format's reader, transforms each block of every MCU and hands the MCU to
+// the block coder. Blocks wholly outside the image become cheap dummies.
+#include "api/output_target.h"
+#include "core/entropy_coder.h"
+#include "core/forward_dct.h"
+#include "input/readers.h"
+#include "core/band_driver.h"
+
+#include <cstring>
+
+namespace tekoj {
+namespace {
+
+// Zero block whose DC repeats `dc`: codes as a zero difference and EOB.
+inline void dummy_block(int16_t* blk, int16_t dc) {
+    std::memset(blk, 0, 64 * sizeof(int16_t));
+    blk[0] = dc;
+}
+
+}  // namespace
+
+bool compress_band(EncoderContext* ctx, uint8_t** const* row_arrays) {
+    McuState* st = ctx->mcu_state;
+    const uint32_t last_col = ctx->mcus_per_row - 1;
+    const uint32_t last_band = ctx->total_imcu_rows - 1;
+    int16_t* const* mcu = st->mcu_buffer;
+    for (uint32_t y = st->mcu_vert_offset; y < st->mcu_rows_per_imcu_row; ++y) {
+        for (uint32_t x = st->mcu_ctr; x <= last_col; ++x) {
+            uint32_t blkn = 0;
+            for (int c = 0; c < ctx->comps_in_scan; ++c) {
+                const ComponentInfo* comp = ctx->cur_comp_info[c];
+                const uint32_t count = x < last_col ? comp->mcu_width : comp->last_col_width;
+                const uint32_t start_col = x * comp->mcu_sample_width;
+                uint32_t start_row = y * 8;
+                uint8_t* const* rows = row_arrays[comp->component_index];
+                const uint32_t* divisors = ctx->divisors[comp->quant_tbl_no];
+                for (uint32_t r = 0; r < comp->mcu_height; ++r) {
+                    if (st->imcu_row < last_band || y + r < comp->last_row_height) {
+                        for (uint32_t j = 0; j < count; ++j)
+                            forward_dct_block(rows, start_row, start_col + 8 * j, divisors, mcu[blkn + j]);
+                        for (uint32_t j = count; j < comp->mcu_width; ++j)
+                            dummy_block(mcu[blkn + j], mcu[blkn + j - 1][0]);
+                    } else {
+                        for (uint32_t j = 0; j < comp->mcu_width; ++j)
+                            dummy_block(mcu[blkn + j], mcu[blkn - 1][0]);
+                    }
+                    blkn += comp->mcu_width;
+                    start_row += 8;
+                }
+            }
+            if (!encode_mcu(ctx, mcu)) return false;
+        }
+        st->mcu_ctr = 0;
+    }
+    ++st->imcu_row;
+    __eko_jpeg_enc_setup_imcu(ctx);
+    return true;
+}
+
+bool process_band(EncoderContext* ctx) {
+    if (ctx->failed != 0) return false;
+    read_band(ctx);
+    SampleRowSet* rows = ctx->sample_rows;
+    const bool ok = compress_band(ctx, rows->row_arrays);
+    ++rows->band_counter;
+    rows->band_flag = 0;
+    return ok;
+}
+
+}  // namespace tekoj
+
+extern "C" {
+
+EKO_API uint32_t __eko_jpeg_enc_set_component_info(EncoderContext* context, uint32_t index, uint32_t id, uint8_t h,
+                                                   uint8_t v, uint8_t quant_tbl_no, uint8_t dc_tbl_no,
+                                                   uint8_t ac_tbl_no) {
+    ComponentInfo* comp = &context->comp_info[index];
+    comp->component_id = static_cast<uint8_t>(id);
+    comp->component_index = static_cast<uint8_t>(index);
+    comp->h_samp_factor = h;
+    comp->v_samp_factor = v;
+    comp->quant_tbl_no = quant_tbl_no;
+    comp->dc_tbl_no = dc_tbl_no;
+    comp->ac_tbl_no = ac_tbl_no;
+    if (h > context->max_h_samp) context->max_h_samp = h;
+    if (v > context->max_v_samp) context->max_v_samp = v;
+    return 1;
+}
+
+EKO_API uint32_t __eko_jpeg_enc_setup_scan(EncoderContext* context) {
+    const uint32_t width = static_cast<uint32_t>(context->width);
+    const uint32_t height = static_cast<uint32_t>(context->height);
+    if (context->comps_in_scan == 1) {
+        ComponentInfo* comp = context->cur_comp_info[0];
+        context->mcus_per_row = comp->width_in_blocks;
+        context->mcu_rows_in_scan = comp->height_in_blocks;
+        comp->mcu_width = comp->mcu_height = comp->mcu_blocks = 1;
+        comp->mcu_sample_width = 8;
+        comp->last_col_width = 1;
+        const uint32_t rem = comp->height_in_blocks % comp->v_samp_factor;
+        comp->last_row_height = rem == 0 ? comp->v_samp_factor : rem;
+        context->blocks_in_mcu = 1;
+        context->mcu_membership[0] = 0;
+        return 1;
+    }
+    const uint32_t mcu_w = context->max_h_samp * 8u, mcu_h = context->max_v_samp * 8u;
+    context->mcus_per_row = (width + mcu_w - 1) / mcu_w;
+    context->mcu_rows_in_scan = (height + mcu_h - 1) / mcu_h;
+    uint32_t blocks = 0;
+    for (int c = 0; c < context->comps_in_scan; ++c) {
+        ComponentInfo* comp = context->cur_comp_info[c];
+        const uint32_t h = comp->h_samp_factor, v = comp->v_samp_factor;
+        comp->mcu_width = h;
+        comp->mcu_height = v;
+        comp->mcu_blocks = h * v;
+        comp->mcu_sample_width = h * 8;
+        const uint32_t wrem = comp->width_in_blocks % h;
+        comp->last_col_width = wrem == 0 ? h : wrem;
+        const uint32_t hrem = comp->height_in_blocks % v;
+        comp->last_row_height = hrem == 0 ? v : hrem;
+        if (blocks + h * v > 10) {
+            eko_SetError(EKO_ERR_SAMPLING);
+            return 0;
+        }
+        for (uint32_t k = 0; k < h * v; ++k) context->mcu_membership[blocks + k] = static_cast<uint32_t>(c);
+        blocks += h * v;
+    }
+    context->blocks_in_mcu = static_cast<uint8_t>(blocks);
+    return 1;
+}
+
+EKO_API uint32_t __eko_jpeg_enc_setup_imcu(EncoderContext* context) {
+    McuState* st = context->mcu_state;
+    const bool last = st->imcu_row == context->total_imcu_rows - 1;
+    if (context->comps_in_scan > 1) {
+        st->mcu_rows_per_imcu_row = 1;
+    } else {
+        const ComponentInfo* comp = context->cur_comp_info[0];
+        st->mcu_rows_per_imcu_row = last ? comp->last_row_height : comp->v_samp_factor;
+    }
+    if (last) {
+        for (int c = 0; c < context->comps_in_scan; ++c) {
+            ComponentInfo* comp = context->cur_comp_info[c];
+            const uint32_t rem = comp->downsampled_height % comp->band_rows;
+            comp->rows_this_band = rem == 0 ? comp->band_rows : rem;
+        }
+    }
+    st->mcu_ctr = 0;
+    st->mcu_vert_offset = 0;
+    return 1;
+}
+
+EKO_API uint32_t __eko_jpeg_enc_compress_data(EncoderContext* context, uint8_t** const* row_arrays) {
+    return tekoj::compress_band(context, row_arrays) ? 1 : 0;
+}
+
+EKO_API uint32_t __eko_jpeg_enc_process_image_data(EncoderContext* context) {
+    return tekoj::process_band(context) ? 1 : 0;
+}
+
+}  // extern "C"

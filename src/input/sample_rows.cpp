@@ -1,0 +1,88 @@
+// Band sample rows and the planar readers (planar YUV 4:2:0, grey, and a luma
+// plane followed by an interleaved V/U plane).
+#include "input/edge_fill.h"
+#include "input/readers.h"
+
+extern "C" {
+
+EKO_API uint8_t** __eko_jpeg_enc_alloc_sample_arry(EncoderContext* context, uint32_t row_length,
+                                                   uint32_t row_count) {
+    (void)context;
+    auto** rows = static_cast<uint8_t**>(DORVATEKO_OsMalloc(row_count * static_cast<uint32_t>(sizeof(uint8_t*))));
+    if (rows == nullptr) {
+        eko_SetError(EKO_ERR_ALLOC);
+        return nullptr;
+    }
+    for (uint32_t r = 0; r < row_count; ++r) {
+        rows[r] = static_cast<uint8_t*>(DORVATEKO_OsMalloc(row_length));
+        if (rows[r] == nullptr) {
+            for (uint32_t k = 0; k < r; ++k) DORVATEKO_OsFree(rows[k]);
+            DORVATEKO_OsFree(rows);
+            eko_SetError(EKO_ERR_ALLOC);
+            return nullptr;
+        }
+    }
+    return rows;
+}
+
+EKO_API uint32_t __eko_jpeg_enc_get_raw_data(EncoderContext* context) {
+    const uint8_t** planes[3] = {&context->plane_y, &context->plane_u, &context->plane_v};
+    for (int c = 0; c < context->num_components && c < 3; ++c) {
+        const ComponentInfo& comp = context->comp_info[c];
+        uint8_t* const* rows = context->sample_rows->row_arrays[c];
+        const uint8_t* p = *planes[c];
+        const uint32_t n = comp.downsampled_width;
+        for (uint32_t r = 0; r < comp.rows_this_band; ++r) {
+            DORVATEKO_OsMemcpy(rows[r], p, n);
+            p += n;
+        }
+        tekoj::fill_component_edges(rows, comp, n, comp.rows_this_band);
+        *planes[c] = p;
+    }
+    return 1;
+}
+
+EKO_API uint32_t __eko_jpeg_enc_get_raw_pvu_data(EncoderContext* context) {
+    const ComponentInfo& y = context->comp_info[0];
+    uint8_t* const* yrows = context->sample_rows->row_arrays[0];
+    for (uint32_t r = 0; r < y.rows_this_band; ++r) {
+        DORVATEKO_OsMemcpy(yrows[r], context->plane_y, y.downsampled_width);
+        context->plane_y += y.downsampled_width;
+    }
+    tekoj::fill_component_edges(yrows, y, y.downsampled_width, y.rows_this_band);
+
+    const ComponentInfo& cb = context->comp_info[1];
+    const ComponentInfo& cr = context->comp_info[2];
+    uint8_t* const* cbrows = context->sample_rows->row_arrays[1];
+    uint8_t* const* crrows = context->sample_rows->row_arrays[2];
+    const uint32_t n = cb.downsampled_width;
+    for (uint32_t r = 0; r < cb.rows_this_band; ++r) {
+        const uint8_t* src = context->plane_v;
+        context->plane_v += 2 * static_cast<size_t>(n);
+        for (uint32_t x = 0; x < n; ++x) {
+            crrows[r][x] = src[2 * x];      // V comes first in each pair
+            cbrows[r][x] = src[2 * x + 1];
+        }
+    }
+    tekoj::fill_component_edges(cbrows, cb, n, cb.rows_this_band);
+    tekoj::fill_component_edges(crrows, cr, n, cb.rows_this_band);
+    return 1;
+}
+
+}  // extern "C"
+
+namespace tekoj {
+
+void read_band(EncoderContext* ctx) {
+    switch (ctx->format) {
+        case EKO_FORMAT_YUV420:
+        case EKO_FORMAT_GREY: __eko_jpeg_enc_get_raw_data(ctx); break;
+        case EKO_FORMAT_RGB565: __eko_jpeg_enc_get_raw_rgb565_data(ctx); break;
+        case EKO_FORMAT_RGB888: __eko_jpeg_enc_get_raw_rgb888_data(ctx); break;
+        case EKO_FORMAT_RGBA8888: __eko_jpeg_enc_get_raw_rgba8888_data(ctx); break;
+        case EKO_FORMAT_BGRA8888: __eko_jpeg_enc_get_raw_bgra8888_data(ctx); break;
+        default: break;
+    }
+}
+
+}  // namespace tekoj

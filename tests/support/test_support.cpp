@@ -1,0 +1,197 @@
+#include "support/test_support.h"
+
+#include <turbojpeg.h>
+
+#include <cmath>
+#include <cstdio>
+#include <fstream>
+#include <iterator>
+#include <unistd.h>
+
+namespace tekoj_test {
+
+Decoded decode_jpeg(const Bytes& jpeg, bool force_grey) {
+    Decoded d;
+    tjhandle h = tjInitDecompress();
+    int w = 0, hgt = 0, subsamp = 0, cs = 0;
+    if (tjDecompressHeader3(h, jpeg.data(), static_cast<unsigned long>(jpeg.size()), &w, &hgt, &subsamp, &cs) != 0) {
+        d.message = tjGetErrorStr2(h);
+        tjDestroy(h);
+        return d;
+    }
+    const bool grey = force_grey || cs == TJCS_GRAY;
+    d.width = w;
+    d.height = hgt;
+    d.components = grey ? 1 : 3;
+    d.pixels.resize(static_cast<size_t>(w) * hgt * d.components);
+    int rc = tjDecompress2(h, jpeg.data(), static_cast<unsigned long>(jpeg.size()), d.pixels.data(), w, 0, hgt,
+                           grey ? TJPF_GRAY : TJPF_RGB, TJFLAG_ACCURATEDCT);
+    if (rc != 0) {
+        d.message = tjGetErrorStr2(h);
+        d.warning = tjGetErrorCode(h) == TJERR_WARNING;
+        d.ok = d.warning;
+    } else {
+        d.ok = true;
+    }
+    tjDestroy(h);
+    return d;
+}
+
+double psnr(const uint8_t* a, const uint8_t* b, size_t count) {
+    double se = 0;
+    for (size_t i = 0; i < count; ++i) {
+        double diff = static_cast<double>(a[i]) - b[i];
+        se += diff * diff;
+    }
+    if (se == 0) return 99.0;
+    return 10.0 * std::log10(255.0 * 255.0 * static_cast<double>(count) / se);
+}
+
+Bytes photo_rgb(int width, int height, uint32_t seed) {
+    Bytes out(static_cast<size_t>(width) * height * 3);
+    uint32_t s = seed * 2654435761u + 12345u;
+    for (int y = 0; y < height; ++y) {
+        for (int x = 0; x < width; ++x) {
+            s = s * 1664525u + 1013904223u;
+            const int noise = static_cast<int>((s >> 24) & 7) - 3;
+            const double fx = static_cast<double>(x) / (width > 1 ? width - 1 : 1);
+            const double fy = static_cast<double>(y) / (height > 1 ? height - 1 : 1);
+            const double ring = std::sin((fx * fx + fy * fy) * 9.0);
+            int r = static_cast<int>(40 + 170 * fx + 30 * ring) + noise;
+            int g = static_cast<int>(60 + 120 * fy + 40 * std::cos(fx * 5.0)) + noise;
+            int b = static_cast<int>(200 - 150 * fx * fy + 25 * ring) + noise;
+            const size_t i = (static_cast<size_t>(y) * width + x) * 3;
+            out[i] = static_cast<uint8_t>(r < 0 ? 0 : r > 255 ? 255 : r);
+            out[i + 1] = static_cast<uint8_t>(g < 0 ? 0 : g > 255 ? 255 : g);
+            out[i + 2] = static_cast<uint8_t>(b < 0 ? 0 : b > 255 ? 255 : b);
+        }
+    }
+    return out;
+}
+
+int bytes_per_pixel(uint32_t format) {
+    switch (format) {
+        case EKO_FORMAT_RGB565: return 2;
+        case EKO_FORMAT_RGB888: return 3;
+        case EKO_FORMAT_RGBA8888:
+        case EKO_FORMAT_BGRA8888: return 4;
+        default: return 0;
+    }
+}
+
+size_t image_size(uint32_t format, int width, int height) {
+    const size_t n = static_cast<size_t>(width) * height;
+    if (format == EKO_FORMAT_GREY) return n;
+    if (format == EKO_FORMAT_YUV420) return n + 2 * static_cast<size_t>((width + 1) / 2) * ((height + 1) / 2);
+    return n * bytes_per_pixel(format);
+}
+
+static uint8_t clamp255(int v) { return static_cast<uint8_t>(v < 0 ? 0 : v > 255 ? 255 : v); }
+
+Bytes rgb_to_yuv420(const Bytes& rgb, int width, int height) {
+    const int cw = (width + 1) / 2, ch = (height + 1) / 2;
+    Bytes out(image_size(EKO_FORMAT_YUV420, width, height));
+    uint8_t* y = out.data();
+    uint8_t* u = y + static_cast<size_t>(width) * height;
+    uint8_t* v = u + static_cast<size_t>(cw) * ch;
+    for (int j = 0; j < height; ++j)
+        for (int i = 0; i < width; ++i) {
+            const uint8_t* p = &rgb[(static_cast<size_t>(j) * width + i) * 3];
+            y[static_cast<size_t>(j) * width + i] = clamp255(static_cast<int>(std::lround(0.299 * p[0] + 0.587 * p[1] + 0.114 * p[2])));
+        }
+    for (int j = 0; j < ch; ++j)
+        for (int i = 0; i < cw; ++i) {
+            double r = 0, g = 0, b = 0;
+            int n = 0;
+            for (int dy = 0; dy < 2; ++dy)
+                for (int dx = 0; dx < 2; ++dx) {
+                    int xx = 2 * i + dx, yy = 2 * j + dy;
+                    if (xx >= width || yy >= height) continue;
+                    const uint8_t* p = &rgb[(static_cast<size_t>(yy) * width + xx) * 3];
+                    r += p[0];
+                    g += p[1];
+                    b += p[2];
+                    ++n;
+                }
+            r /= n;
+            g /= n;
+            b /= n;
+            u[static_cast<size_t>(j) * cw + i] = clamp255(static_cast<int>(std::lround(128 - 0.168736 * r - 0.331264 * g + 0.5 * b)));
+            v[static_cast<size_t>(j) * cw + i] = clamp255(static_cast<int>(std::lround(128 + 0.5 * r - 0.418688 * g - 0.081312 * b)));
+        }
+    return out;
+}
+
+Bytes rgb_to_grey(const Bytes& rgb, int width, int height) {
+    Bytes out(static_cast<size_t>(width) * height);
+    for (size_t i = 0; i < out.size(); ++i)
+        out[i] = clamp255(static_cast<int>(std::lround(0.299 * rgb[3 * i] + 0.587 * rgb[3 * i + 1] + 0.114 * rgb[3 * i + 2])));
+    return out;
+}
+
+Bytes rgb_to_format(const Bytes& rgb, int width, int height, uint32_t format) {
+    const size_t n = static_cast<size_t>(width) * height;
+    switch (format) {
+        case EKO_FORMAT_YUV420: return rgb_to_yuv420(rgb, width, height);
+        case EKO_FORMAT_GREY: return rgb_to_grey(rgb, width, height);
+        case EKO_FORMAT_RGB888: return rgb;
+        case EKO_FORMAT_RGB565: {
+            Bytes out(n * 2);
+            for (size_t i = 0; i < n; ++i) {
+                uint16_t p = static_cast<uint16_t>(((rgb[3 * i] >> 3) << 11) | ((rgb[3 * i + 1] >> 2) << 5) | (rgb[3 * i + 2] >> 3));
+                out[2 * i] = static_cast<uint8_t>(p);
+                out[2 * i + 1] = static_cast<uint8_t>(p >> 8);
+            }
+            return out;
+        }
+        case EKO_FORMAT_RGBA8888:
+        case EKO_FORMAT_BGRA8888: {
+            Bytes out(n * 4);
+            const bool bgr = format == EKO_FORMAT_BGRA8888;
+            for (size_t i = 0; i < n; ++i) {
+                out[4 * i] = rgb[3 * i + (bgr ? 2 : 0)];
+                out[4 * i + 1] = rgb[3 * i + 1];
+                out[4 * i + 2] = rgb[3 * i + (bgr ? 0 : 2)];
+                out[4 * i + 3] = 0xA5;
+            }
+            return out;
+        }
+        default: return {};
+    }
+}
+
+ImageInfo image_info(const void* data, int width, int height, uint32_t format) {
+    ImageInfo info{};
+    info.width = width;
+    info.height = height;
+    info.data = data;
+    info.format = format;
+    return info;
+}
+
+Bytes encode_to_memory(const ImageInfo& info, uint32_t quality) {
+    uint8_t* block = static_cast<uint8_t*>(DORVATEKO_OsMalloc(4096));
+    int32_t length = 4096;
+    if (eko_enc_jpeg_to_buffer(&info, &block, &length, quality) != 1) {
+        DORVATEKO_OsFree(block);
+        return {};
+    }
+    Bytes out(block, block + length);
+    DORVATEKO_OsFree(block);
+    return out;
+}
+
+Bytes read_file(const std::string& path) {
+    std::ifstream f(path, std::ios::binary);
+    return Bytes(std::istreambuf_iterator<char>(f), std::istreambuf_iterator<char>());
+}
+
+bool file_exists(const std::string& path) { return std::ifstream(path).good(); }
+
+std::string golden_path(const std::string& name) { return std::string(TEKOJ_GOLDEN_DIR) + "/" + name; }
+
+std::string temp_path(const std::string& name) {
+    return "/tmp/tekoj_test_" + std::to_string(::getpid()) + "_" + name;
+}
+
+}  // namespace tekoj_test

@@ -1,0 +1,51 @@
+// Shared helpers of the test suite: decoding with libjpeg-turbo, image
+// generators, golden files.
+#pragma once
+
+#include <TekoJEncoder.h>
+
+#include <cstdint>
+#include <string>
+#include <vector>
+
+namespace tekoj_test {
+
+using Bytes = std::vector<uint8_t>;
+
+struct Decoded {
+    bool ok = false;        // decoded without error
+    bool warning = false;   // libjpeg-turbo reported a warning
+    std::string message;    // its message, if any
+    int width = 0, height = 0, components = 0;
+    Bytes pixels;           // RGB (3 bytes per pixel) or grey
+};
+
+// Decodes a JPEG stream; colour streams to RGB, grey to one byte per pixel.
+Decoded decode_jpeg(const Bytes& jpeg, bool force_grey = false);
+
+// Peak signal-to-noise ratio of two same-sized sample arrays, in dB.
+double psnr(const uint8_t* a, const uint8_t* b, size_t count);
+
+// A smooth, photo-like RGB image (gradients, soft edges, mild texture).
+Bytes photo_rgb(int width, int height, uint32_t seed = 1);
+// Converts interleaved RGB to another input layout of the library.
+Bytes rgb_to_format(const Bytes& rgb, int width, int height, uint32_t format);
+// Planar YUV 4:2:0 (format 2) from RGB, and grey (format 4) from RGB.
+Bytes rgb_to_yuv420(const Bytes& rgb, int width, int height);
+Bytes rgb_to_grey(const Bytes& rgb, int width, int height);
+// Bytes per pixel of a packed format; 0 for planar ones.
+int bytes_per_pixel(uint32_t format);
+// Size of an image buffer of the given format.
+size_t image_size(uint32_t format, int width, int height);
+
+// Whole-image encode to a memory block; empty on failure.
+Bytes encode_to_memory(const ImageInfo& info, uint32_t quality);
+ImageInfo image_info(const void* data, int width, int height, uint32_t format);
+
+// Files.
+Bytes read_file(const std::string& path);
+bool file_exists(const std::string& path);
+std::string golden_path(const std::string& name);
+std::string temp_path(const std::string& name);
+
+}  // namespace tekoj_test
