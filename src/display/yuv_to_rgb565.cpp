@@ -1,0 +1,175 @@
+// YUV 4:2:0 to RGB565 for previews on the device's display.
+//
+// Everything is table driven: the four chroma tables give each chroma byte's
+// contribution to R, G and B, and the clamp table turns "luma plus
+// contribution" into 0..255 without a branch. The tables are constant data
+// built by the compiler, so the converters share nothing writable and may run
+// on any thread.
+//
+// The chroma tables are centred on index 127, not 128, so a neutral chroma
+// byte of 128 already adds a small tint (R +1, G -1, B +2). Callers compare
+// previews against this exact output; the offset is part of the contract and
+// must not be "corrected".
+#include <TekoJEncoder.h>
+
+#include <cstddef>
+#include <cstdint>
+
+namespace {
+
+// Arithmetic right shift, floor for negative values (C++20 defines >> so).
+constexpr int32_t red_from_cr(int i) { return (91881 * (i - 127) + 32768) >> 16; }
+constexpr int32_t blue_from_cb(int i) { return (116130 * (i - 127) + 32768) >> 16; }
+// The two green terms stay in 16.16 fixed point; the rounding half rides on
+// the Cb term so that one add and one shift per chroma sample suffice.
+constexpr int32_t green_from_cr(int i) { return -46802 * (i - 127); }
+constexpr int32_t green_from_cb(int i) { return -22554 * (i - 127) + 32768; }
+constexpr uint8_t clamp_entry(int k) {
+    return static_cast<uint8_t>(k <= 512 ? 0 : (k >= 767 ? 255 : k - 512));
+}
+
+// The exported tables are plain C arrays, so they are spelled out as brace
+// lists of constexpr calls; the compiler evaluates every entry.
+#define TEKOJ_T4(f, n) f(n), f(n + 1), f(n + 2), f(n + 3)
+#define TEKOJ_T16(f, n) TEKOJ_T4(f, n), TEKOJ_T4(f, n + 4), TEKOJ_T4(f, n + 8), TEKOJ_T4(f, n + 12)
+#define TEKOJ_T64(f, n) TEKOJ_T16(f, n), TEKOJ_T16(f, n + 16), TEKOJ_T16(f, n + 32), TEKOJ_T16(f, n + 48)
+#define TEKOJ_T256(f, n) TEKOJ_T64(f, n), TEKOJ_T64(f, n + 64), TEKOJ_T64(f, n + 128), TEKOJ_T64(f, n + 192)
+
+}  // namespace
+
+extern "C" {
+
+EKO_API extern constexpr int32_t eko_EnCrrTab[256] = {TEKOJ_T256(red_from_cr, 0)};
+EKO_API extern constexpr int32_t eko_EnCbbTab[256] = {TEKOJ_T256(blue_from_cb, 0)};
+EKO_API extern constexpr int32_t eko_EnCrgTab[256] = {TEKOJ_T256(green_from_cr, 0)};
+EKO_API extern constexpr int32_t eko_EnCbgTab[256] = {TEKOJ_T256(green_from_cb, 0)};
+EKO_API extern constexpr uint8_t eko_EnRangeTalbe[1024] = {TEKOJ_T256(clamp_entry, 0), TEKOJ_T256(clamp_entry, 256),
+                                                    TEKOJ_T256(clamp_entry, 512), TEKOJ_T256(clamp_entry, 768)};
+
+}  // extern "C"
+
+#undef TEKOJ_T256
+#undef TEKOJ_T64
+#undef TEKOJ_T16
+#undef TEKOJ_T4
+
+namespace {
+
+static_assert(eko_EnCrrTab[0] == -178 && eko_EnCrrTab[127] == 0 && eko_EnCrrTab[128] == 1 && eko_EnCrrTab[255] == 179);
+static_assert(eko_EnCbbTab[0] == -225 && eko_EnCbbTab[127] == 0 && eko_EnCbbTab[128] == 2 && eko_EnCbbTab[255] == 227);
+static_assert(eko_EnCrgTab[0] == 5943854 && eko_EnCrgTab[255] == -5990656);
+static_assert(eko_EnCbgTab[0] == 2897126 && eko_EnCbgTab[127] == 32768 && eko_EnCbgTab[255] == -2854144);
+static_assert(eko_EnRangeTalbe[0] == 0 && eko_EnRangeTalbe[512] == 0 && eko_EnRangeTalbe[600] == 88 &&
+              eko_EnRangeTalbe[767] == 255 && eko_EnRangeTalbe[1023] == 255);
+
+// Luma plus any contribution lies in -225..482, well inside the clamp table
+// once it is addressed from its middle.
+constexpr const uint8_t* kClamp = eko_EnRangeTalbe + 512;
+
+// The three per-chroma-sample offsets, looked up once per 2x2 block.
+struct Chroma {
+    int32_t red;
+    int32_t green;
+    int32_t blue;
+};
+
+inline Chroma chroma_of(uint8_t cb, uint8_t cr) {
+    return {eko_EnCrrTab[cr], (eko_EnCrgTab[cr] + eko_EnCbgTab[cb]) >> 16, eko_EnCbbTab[cb]};
+}
+
+inline uint16_t pixel_of(uint8_t luma, const Chroma& c) {
+    const int32_t y = luma;
+    const uint32_t r = kClamp[y + c.red];
+    const uint32_t g = kClamp[y + c.green];
+    const uint32_t b = kClamp[y + c.blue];
+    return static_cast<uint16_t>(((r >> 3) << 11) | ((g >> 2) << 5) | (b >> 3));
+}
+
+// Both source layouts share the walk; they differ only in where the Cb/Cr
+// pair of chroma sample k of a chroma row lives.
+struct ThreePlanes {
+    const uint8_t* u;  // Cb plane
+    const uint8_t* v;  // Cr plane
+    size_t chroma_width;
+    struct Row {
+        const uint8_t* u;
+        const uint8_t* v;
+        Chroma at(size_t k) const { return chroma_of(u[k], v[k]); }
+    };
+    Row row(size_t j) const { return {u + j * chroma_width, v + j * chroma_width}; }
+};
+
+struct InterleavedVu {
+    const uint8_t* vu;  // pairs of V (Cr) first, then U (Cb)
+    size_t chroma_width;
+    struct Row {
+        const uint8_t* vu;
+        Chroma at(size_t k) const { return chroma_of(vu[2 * k + 1], vu[2 * k]); }
+    };
+    Row row(size_t j) const { return {vu + 2 * j * chroma_width}; }
+};
+
+// Converts the luma row(s) that share one chroma row: two rows for every row
+// pair, one for the last row of an odd height.
+template <bool TwoRows, typename ChromaRow>
+inline void convert_rows(const ChromaRow& chroma, const uint8_t* y0, uint16_t* d0, size_t width) {
+    [[maybe_unused]] const uint8_t* y1 = y0 + width;
+    [[maybe_unused]] uint16_t* d1 = d0 + width;
+    const size_t pairs = width >> 1;
+    for (size_t k = 0; k < pairs; ++k) {
+        const Chroma c = chroma.at(k);
+        d0[2 * k] = pixel_of(y0[2 * k], c);
+        d0[2 * k + 1] = pixel_of(y0[2 * k + 1], c);
+        if constexpr (TwoRows) {
+            d1[2 * k] = pixel_of(y1[2 * k], c);
+            d1[2 * k + 1] = pixel_of(y1[2 * k + 1], c);
+        }
+    }
+    if (width & 1) {
+        // An odd width leaves a last chroma column that serves one pixel column.
+        const Chroma c = chroma.at(pairs);
+        d0[width - 1] = pixel_of(y0[width - 1], c);
+        if constexpr (TwoRows) d1[width - 1] = pixel_of(y1[width - 1], c);
+    }
+}
+
+template <typename Source>
+void convert_frame(const Source& src, const uint8_t* luma, size_t width, size_t height, uint16_t* dst) {
+    for (size_t j = 0; j < (height >> 1); ++j)
+        convert_rows<true>(src.row(j), luma + 2 * j * width, dst + 2 * j * width, width);
+    if (height & 1) {
+        const size_t last = height - 1;
+        convert_rows<false>(src.row(height >> 1), luma + last * width, dst + last * width, width);
+    }
+}
+
+inline bool usable(const uint8_t* source, int32_t width, int32_t height, const uint16_t* destination) {
+    return source != nullptr && destination != nullptr && width > 0 && height > 0;
+}
+
+}  // namespace
+
+extern "C" {
+
+EKO_API uint32_t eko_DuoYUV420toRGB565(const uint8_t* source, int32_t width, int32_t height, uint16_t* destination) {
+    if (!usable(source, width, height, destination)) return 0;
+    const size_t w = static_cast<size_t>(width);
+    const size_t h = static_cast<size_t>(height);
+    const size_t cw = (w + 1) >> 1;
+    const size_t ch = (h + 1) >> 1;
+    const ThreePlanes planes{source + w * h, source + w * h + cw * ch, cw};
+    convert_frame(planes, source, w, h, destination);
+    return 1;
+}
+
+EKO_API uint32_t eko_DuoPYV0420toRGB565(const uint8_t* source, int32_t width, int32_t height,
+                                        uint16_t* destination) {
+    if (!usable(source, width, height, destination)) return 0;
+    const size_t w = static_cast<size_t>(width);
+    const size_t h = static_cast<size_t>(height);
+    const InterleavedVu plane{source + w * h, (w + 1) >> 1};
+    convert_frame(plane, source, w, h, destination);
+    return 1;
+}
+
+}  // extern "C"
