@@ -1,0 +1,16 @@
+#!/bin/sh
+# Installs the build tools, builds the library and the command-line tool, and
+# encodes the built-in sample image to build/tekoj-sample.jpg.
+set -eu
+cd "$(dirname "$0")/.."
+SUDO=""
+[ "$(id -u)" -eq 0 ] || SUDO="sudo"
+export DEBIAN_FRONTEND=noninteractive
+if ! command -v cmake >/dev/null || ! command -v g++ >/dev/null || ! command -v ninja >/dev/null \
+   || ! command -v pkg-config >/dev/null || ! dpkg -s libpng-dev >/dev/null 2>&1; then
+  $SUDO apt-get update -q
+  $SUDO apt-get install -y -q cmake g++ ninja-build pkg-config libpng-dev
+fi
+cmake -S . -B build -G Ninja -DCMAKE_BUILD_TYPE=Release -DTEKOJ_BUILD_TESTS=OFF -DTEKOJ_BUILD_BENCH=OFF
+cmake --build build
+cd build && ./tools/tekoj-encode
