@@ -71,7 +71,19 @@ struct BitWriter {
     }
 };
 
-inline int magnitude_bits(uint32_t a) { return a == 0 ? 0 : std::bit_width(a); }
+// Magnitude category of a value and its extra bits: the value itself when
+// positive, the one's complement of its magnitude when negative.
+struct Magnitude {
+    int bits;
+    uint32_t extra;
+};
+
+inline Magnitude magnitude(int32_t x) {
+    const uint32_t a = static_cast<uint32_t>(x < 0 ? -x : x);
+    const int k = std::bit_width(a);
+    const uint32_t v = static_cast<uint32_t>(x < 0 ? x - 1 : x);
+    return {k, v & ((1u << k) - 1)};
+}
 
 inline void code_block(BitWriter& w, const int16_t* blk, int32_t diff, const DcCodeTable* dc,
                        const AcCodeTable* ac) {
@@ -79,15 +91,8 @@ inline void code_block(BitWriter& w, const int16_t* blk, int32_t diff, const DcC
         // The pixel path never exceeds category 11; a caller's blocks might.
         if (diff > 2047) diff = 2047;
         if (diff < -2047) diff = -2047;
-        int32_t v = diff;
-        uint32_t a = static_cast<uint32_t>(diff);
-        if (diff < 0) {
-            a = static_cast<uint32_t>(-diff);
-            v = diff - 1;
-        }
-        const int k = magnitude_bits(a);
-        const uint32_t extra = static_cast<uint32_t>(v) & ((1u << k) - 1);
-        w.put((static_cast<uint32_t>(dc->code[k]) << k) | extra, dc->size[k] + k);
+        const Magnitude m = magnitude(diff);
+        w.put((static_cast<uint32_t>(dc->code[m.bits]) << m.bits) | m.extra, dc->size[m.bits] + m.bits);
     }
     // Positions 1..62 in zig-zag order; position 63 is never coded, every
     // block ends with EOB.
@@ -112,16 +117,9 @@ inline void code_block(BitWriter& w, const int16_t* blk, int32_t diff, const DcC
         // Values beyond the baseline tables' largest category cannot be coded.
         if (x > 1023) x = 1023;
         if (x < -1023) x = -1023;
-        int32_t v = x;
-        uint32_t a = static_cast<uint32_t>(x);
-        if (x < 0) {
-            a = static_cast<uint32_t>(-x);
-            v = x - 1;
-        }
-        const int k = std::bit_width(a);
-        const int sym = (run << 4) + k;
-        w.put((static_cast<uint32_t>(ac->code[sym]) << k) | (static_cast<uint32_t>(v) & ((1u << k) - 1)),
-              ac->size[sym] + k);
+        const Magnitude m = magnitude(x);
+        const int sym = (run << 4) + m.bits;
+        w.put((static_cast<uint32_t>(ac->code[sym]) << m.bits) | m.extra, ac->size[sym] + m.bits);
     }
     w.put(ac->code[0], ac->size[0]);
 }
