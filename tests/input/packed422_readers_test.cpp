@@ -1,192 +1,174 @@
-// Band rows produced by the packed 4:2:2 readers, on a context whose geometry
-// is laid out by hand as creation would, so each band can be inspected alone.
+// The packed 4:2:2 readers: band rows of the defined examples and edges on
+// real contexts, and whole frames encoded through the exported coding steps
+// and decoded by libjpeg-turbo.
 #include <TekoJEncoder.h>
+
+#include "support/fault_os_layer.h"
+#include "support/test_support.h"
 
 #include <gtest/gtest.h>
 
+#include <algorithm>
+#include <cstring>
 #include <memory>
-#include <vector>
+#include <tuple>
 
 namespace {
 
-using Rows = std::vector<std::vector<uint8_t>>;
+using tekoj_test::Bytes;
 
-// A three-component context for a w x h frame with Y sampled yh x yv and
-// chroma 1 x 1, positioned at band `band` of the frame.
-struct BandFixture {
-    std::unique_ptr<EncoderContext> ctx = std::make_unique<EncoderContext>();
-    ComponentInfo comp[3]{};
-    SampleRowSet set{};
-    Rows storage[3];
-    std::vector<uint8_t*> pointers[3];
+// A context coding a w x h packed frame 4:2:0, or 4:2:2 (Y 2x1) when keep422,
+// to a memory block; band rows start as 0xEE so unwritten cells show.
+struct PackedContext {
+    EncoderSettings settings{};
+    EncoderContext* ctx = nullptr;
+    bool keep422;
 
-    BandFixture(uint32_t w, uint32_t h, uint8_t yh, uint8_t yv, uint32_t band = 0) {
-        *ctx = EncoderContext{};
-        ctx->num_components = 3;
-        ctx->comp_info = comp;
-        ctx->sample_rows = &set;
-        for (int c = 0; c < 3; ++c) {
-            const uint32_t hs = c == 0 ? yh : 1, vs = c == 0 ? yv : 1;
-            ComponentInfo& ci = comp[c];
-            ci.width_in_blocks = (w * hs + yh * 8 - 1) / (yh * 8);
-            ci.padded_width = ci.width_in_blocks * 8;
-            ci.downsampled_width = (w * hs + yh - 1) / yh;
-            ci.downsampled_height = (h * vs + yv - 1) / yv;
-            ci.band_rows = vs * 8;
-            const uint32_t bands = (h + yv * 8 - 1) / (yv * 8);
-            const uint32_t rest = ci.downsampled_height % ci.band_rows;
-            ci.rows_this_band = band + 1 == bands && rest != 0 ? rest : ci.band_rows;
-            storage[c].assign(ci.band_rows, std::vector<uint8_t>(ci.width_in_blocks * yh * 8 / hs, 0xEE));
-            for (auto& row : storage[c]) pointers[c].push_back(row.data());
-            set.row_arrays[c] = pointers[c].data();
-            ctx->cur_comp_info[c] = &ci;
+    PackedContext(const uint8_t* data, int w, int h, bool keep) : keep422(keep) {
+        ImageInfo info{w, h, data, 0, 0, 0, 0, 0, EKO_FORMAT_YUV420, nullptr};
+        OutputRequest out{EKO_OUTPUT_MEMORY, nullptr, static_cast<uint8_t*>(DORVATEKO_OsMalloc(4096)), 4096};
+        const EncodeOptions options{90, nullptr, 0};
+        settings.num_components = 3;
+        settings.num_quant_tables = 2;
+        std::memset(settings.quant_tables, 3, sizeof settings.quant_tables);
+        settings.write_dri = 1;
+        const uint8_t specs[3][3] = {{0, 2, 1}, {1, 1, 1}, {1, 1, 1}};
+        std::memcpy(settings.component_specs, specs, sizeof specs);
+        ctx = __eko_jpeg_enc_initiaize(&info, &out, &options, keep ? &settings : nullptr);
+        if (ctx == nullptr) {
+            DORVATEKO_OsFree(out.buffer);
+            return;
         }
+        for (int c = 0; c < 3; ++c)
+            for (uint32_t r = 0; r < ctx->comp_info[c].band_rows; ++r)
+                std::memset(ctx->sample_rows->row_arrays[c][r], 0xEE, ctx->comp_info[c].padded_width);
     }
-    const std::vector<uint8_t>& row(int c, uint32_t r) const { return storage[c][r]; }
-    // The first `padded_width` cells of a row, the part the transform reads.
-    std::vector<uint8_t> cells(int c, uint32_t r) const {
-        return {storage[c][r].begin(), storage[c][r].begin() + comp[c].padded_width};
+    ~PackedContext() {
+        if (ctx == nullptr) return;
+        uint8_t* buffer = ctx->output->buffer;
+        __eko_jpeg_enc_release_mem(ctx);
+        DORVATEKO_OsFree(ctx);
+        DORVATEKO_OsFree(buffer);
+    }
+    uint32_t read() {
+        return keep422 ? __eko_jpeg_enc_get_raw_duoview422_data_for_yuv422(ctx) : __eko_jpeg_enc_get_raw_duoview422_data(ctx);
+    }
+    // The cells of a band row that the transform reads.
+    Bytes cells(int c, uint32_t r) const {
+        const uint8_t* row = ctx->sample_rows->row_arrays[c][r];
+        return Bytes(row, row + ctx->comp_info[c].padded_width);
     }
 };
 
-std::vector<uint8_t> repeat(std::vector<uint8_t> head, size_t total) {
-    while (head.size() < total) head.push_back(head.back());
+Bytes repeat(Bytes head, size_t total) {
+    head.resize(total, head.back());
     return head;
 }
 
-TEST(Packed422Reader, KeepsOneChromaRowPerRowFor422) {
-    BandFixture f(4, 1, 2, 1);
-    const uint8_t src[] = {10, 128, 20, 130, 30, 129, 40, 131};
-    f.ctx->read_ptr = src;
-    EXPECT_EQ(__eko_jpeg_enc_get_raw_duoview422_data_for_yuv422(f.ctx.get()), 1u);
-    EXPECT_EQ(f.cells(0, 0), repeat({10, 20, 30, 40}, 8));
-    EXPECT_EQ(f.cells(1, 0), repeat({128, 129}, 8));
-    EXPECT_EQ(f.cells(2, 0), repeat({130, 131}, 8));
-    for (uint32_t r = 1; r < 8; ++r)
-        for (int c = 0; c < 3; ++c) EXPECT_EQ(f.cells(c, r), f.cells(c, 0)) << "component " << c << " row " << r;
-    EXPECT_EQ(f.ctx->read_ptr, src + 8);
+TEST(Packed422Reader, DefinedExamplesWithRepeatedEdges) {
+    // 4:2:2, width 4, one row: every cell right of and below the data repeats it.
+    const uint8_t row[] = {10, 128, 20, 130, 30, 129, 40, 131};
+    PackedContext f(row, 4, 1, true);
+    ASSERT_EQ(f.read(), 1u);
+    EXPECT_EQ(f.ctx->read_ptr, row + 8);
+    EXPECT_EQ(f.cells(0, 7), repeat({10, 20, 30, 40}, 8));
+    EXPECT_EQ(f.cells(1, 7), repeat({128, 129}, 8));
+    EXPECT_EQ(f.cells(2, 7), repeat({130, 131}, 8));
+
+    // 4:2:0, width 2, two rows: chroma of the upper row, 6 and 8 dropped.
+    const uint8_t rows[] = {1, 2, 3, 4, 5, 6, 7, 8};
+    PackedContext g(rows, 2, 2, false);
+    ASSERT_EQ(g.read(), 1u);
+    EXPECT_EQ(g.ctx->read_ptr, rows + 8);
+    EXPECT_EQ(g.cells(0, 0), repeat({1, 3}, 8));
+    EXPECT_EQ(g.cells(0, 15), repeat({5, 7}, 8));
+    EXPECT_EQ(g.cells(1, 7), repeat({2}, 8));
+    EXPECT_EQ(g.cells(2, 7), repeat({4}, 8));
+
+    // Width 5: 8-byte rows; Y column 4 and chroma column 2 have no sample and
+    // repeat the last written one.
+    const uint8_t odd[] = {11, 21, 12, 31, 13, 22, 14, 32, 15, 23, 16, 33, 17, 24, 18, 34};
+    PackedContext h(odd, 5, 2, true);
+    ASSERT_EQ(h.read(), 1u);
+    EXPECT_EQ(h.ctx->read_ptr, odd + 16);
+    EXPECT_EQ(h.cells(0, 1), repeat({15, 16, 17, 18}, 8));
+    EXPECT_EQ(h.cells(1, 1), repeat({23, 24}, 8));
+    EXPECT_EQ(h.cells(2, 1), repeat({33, 34}, 8));
 }
 
-TEST(Packed422Reader, TakesUpperRowChromaFor420) {
-    BandFixture f(2, 2, 2, 2);
-    const uint8_t src[] = {1, 2, 3, 4, 5, 6, 7, 8};
-    f.ctx->read_ptr = src;
-    EXPECT_EQ(__eko_jpeg_enc_get_raw_duoview422_data(f.ctx.get()), 1u);
-    EXPECT_EQ(f.cells(0, 0), repeat({1, 3}, 8));
-    EXPECT_EQ(f.cells(0, 1), repeat({5, 7}, 8));
-    EXPECT_EQ(f.cells(1, 0), repeat({2}, 8));  // 6 and 8 of the lower row are dropped
-    EXPECT_EQ(f.cells(2, 0), repeat({4}, 8));
-    EXPECT_EQ(f.cells(0, 15), f.cells(0, 1));
-    EXPECT_EQ(f.cells(1, 7), f.cells(1, 0));
-    EXPECT_EQ(f.ctx->read_ptr, src + 8);
-}
-
-TEST(Packed422Reader, FullBandsAdvanceByTheirRows) {
-    for (uint32_t w : {6u, 7u, 40u}) {
-        const uint32_t groups = w >> 1;
-        std::vector<uint8_t> src(16 * groups * 4);
-        for (size_t i = 0; i < src.size(); ++i) src[i] = static_cast<uint8_t>(i * 7 + 3);
-
-        BandFixture f420(w, 32, 2, 2);
-        f420.ctx->read_ptr = src.data();
-        __eko_jpeg_enc_get_raw_duoview422_data(f420.ctx.get());
-        EXPECT_EQ(f420.ctx->read_ptr, src.data() + 16 * groups * 4) << w;
-
-        BandFixture f422(w, 32, 2, 1);
-        f422.ctx->read_ptr = src.data();
-        __eko_jpeg_enc_get_raw_duoview422_data_for_yuv422(f422.ctx.get());
-        EXPECT_EQ(f422.ctx->read_ptr, src.data() + 8 * groups * 4) << w;
-
-        // Every row of the 4:2:2 band carries its own group bytes; the 4:2:0
-        // band's chroma row p is the 4:2:2 band's row 2p.
-        for (uint32_t r = 0; r < 8; ++r) {
-            const uint8_t* s = src.data() + r * groups * 4;
-            for (uint32_t k = 0; k < groups; ++k) {
-                ASSERT_EQ(f422.row(0, r)[2 * k], s[4 * k]);
-                ASSERT_EQ(f422.row(0, r)[2 * k + 1], s[4 * k + 2]);
-                ASSERT_EQ(f422.row(1, r)[k], s[4 * k + 1]);
-                ASSERT_EQ(f422.row(2, r)[k], s[4 * k + 3]);
-            }
-            if (r < 4) {
-                EXPECT_EQ(f420.cells(1, r), f422.cells(1, 2 * r));
-            }
-        }
-    }
-}
-
-// Width 5: rows of two groups; column 4 of Y and column 2 of the chroma rows
-// have no source sample and repeat the last written one, up to padded_width.
-TEST(Packed422Reader, OddWidthRepeatsLastWrittenSample) {
-    const uint8_t src[] = {11, 21, 12, 31, 13, 22, 14, 32, 15, 23, 16, 33, 17, 24, 18, 34};
-    BandFixture f(5, 2, 2, 1);
-    f.ctx->read_ptr = src;
-    __eko_jpeg_enc_get_raw_duoview422_data_for_yuv422(f.ctx.get());
-    EXPECT_EQ(f.ctx->read_ptr, src + 16);
-    EXPECT_EQ(f.cells(0, 1), repeat({15, 16, 17, 18}, 8));
-    EXPECT_EQ(f.cells(1, 1), repeat({23, 24}, 8));
-    EXPECT_EQ(f.cells(2, 1), repeat({33, 34}, 8));
-
-    BandFixture g(5, 2, 2, 2);
-    g.ctx->read_ptr = src;
-    __eko_jpeg_enc_get_raw_duoview422_data(g.ctx.get());
-    EXPECT_EQ(g.cells(0, 0), repeat({11, 12, 13, 14}, 8));
-    EXPECT_EQ(g.cells(1, 0), repeat({21, 22}, 8));
-    EXPECT_EQ(g.cells(2, 0), repeat({31, 32}, 8));
-    EXPECT_EQ(g.cells(0, 15), g.cells(0, 1));
-}
-
-// Height 19: the second band holds 3 rows. The reader must read exactly
-// those three rows (the heap block ends there, so an over-read is caught by
-// the sanitizer build) and let the single last row stand for both rows of
-// its pair.
+// Height 3 in 4:2:0: the band's second pair has only its upper row. Exactly
+// three rows are read (the heap block ends there, so the sanitizer build
+// catches an over-read) and the single last row stands for both.
 TEST(Packed422Reader, OddLastBandReadsOnlyItsRows) {
-    const uint32_t w = 6, groups = 3;
-    auto src = std::make_unique<uint8_t[]>(3 * groups * 4);
-    for (uint32_t i = 0; i < 3 * groups * 4; ++i) src[i] = static_cast<uint8_t>(50 + i);
-    BandFixture f(w, 19, 2, 2, 1);
-    ASSERT_EQ(f.comp[0].rows_this_band, 3u);
-    ASSERT_EQ(f.comp[1].rows_this_band, 2u);
-    f.ctx->read_ptr = src.get();
-    EXPECT_EQ(__eko_jpeg_enc_get_raw_duoview422_data(f.ctx.get()), 1u);
-    EXPECT_EQ(f.ctx->read_ptr, src.get() + 3 * groups * 4);
-    const std::vector<uint8_t> last = repeat({74, 76, 78, 80, 82, 84}, 8);  // source row 2
-    for (uint32_t r = 2; r < 16; ++r) EXPECT_EQ(f.cells(0, r), last) << r;
-    EXPECT_EQ(f.cells(1, 1), repeat({75, 79, 83}, 8));
-    EXPECT_EQ(f.cells(2, 1), repeat({77, 81, 85}, 8));
-    for (uint32_t r = 2; r < 8; ++r) EXPECT_EQ(f.cells(1, r), f.cells(1, 1)) << r;
-}
-
-TEST(Packed422Reader, WidthOneGivesNeutralBandAndReadsNothing) {
-    const uint8_t dummy = 0;
-    for (int yv : {1, 2}) {
-        BandFixture f(1, 8, 2, static_cast<uint8_t>(yv));
-        f.ctx->read_ptr = &dummy;
-        const uint32_t ok = yv == 2 ? __eko_jpeg_enc_get_raw_duoview422_data(f.ctx.get())
-                                    : __eko_jpeg_enc_get_raw_duoview422_data_for_yuv422(f.ctx.get());
-        EXPECT_EQ(ok, 1u);
-        EXPECT_EQ(f.ctx->read_ptr, &dummy);
-        for (int c = 0; c < 3; ++c)
-            for (uint32_t r = 0; r < f.comp[c].band_rows; ++r)
-                EXPECT_EQ(f.cells(c, r), std::vector<uint8_t>(8, 128));
+    auto src = std::make_unique<uint8_t[]>(36);
+    for (uint32_t i = 0; i < 36; ++i) src[i] = static_cast<uint8_t>(50 + i);
+    PackedContext f(src.get(), 6, 3, false);
+    ASSERT_EQ(f.read(), 1u);
+    EXPECT_EQ(f.ctx->read_ptr, src.get() + 36);
+    for (uint32_t r = 2; r < 16; ++r) EXPECT_EQ(f.cells(0, r), repeat({74, 76, 78, 80, 82, 84}, 8)) << r;
+    for (uint32_t r = 1; r < 8; ++r) {
+        EXPECT_EQ(f.cells(1, r), repeat({75, 79, 83}, 8)) << r;
+        EXPECT_EQ(f.cells(2, r), repeat({77, 81, 85}, 8)) << r;
     }
 }
 
-TEST(Packed422Reader, RefusesContextsItCannotFill) {
-    EXPECT_EQ(__eko_jpeg_enc_get_raw_duoview422_data(nullptr), 0u);
-    EXPECT_EQ(__eko_jpeg_enc_get_raw_duoview422_data_for_yuv422(nullptr), 0u);
-
+// A frame one pixel wide holds no group: nothing is read, the band is grey.
+// Contexts that cannot take the rows are refused untouched.
+TEST(Packed422Reader, WidthOneAndUnfitContexts) {
     const uint8_t src[64] = {};
-    BandFixture grey(8, 8, 2, 2);
-    grey.ctx->num_components = 1;
-    grey.ctx->read_ptr = src;
-    EXPECT_EQ(__eko_jpeg_enc_get_raw_duoview422_data(grey.ctx.get()), 0u);
+    PackedContext one(src, 1, 8, true);
+    ASSERT_EQ(one.read(), 1u);
+    EXPECT_EQ(one.ctx->read_ptr, src);
+    for (int c = 0; c < 3; ++c) EXPECT_EQ(one.cells(c, 7), Bytes(8, 128));
 
-    // 4:2:2 rows into a 4:2:0 context would need 16 chroma rows of 8.
-    BandFixture f420(8, 16, 2, 2);
-    f420.ctx->read_ptr = src;
-    EXPECT_EQ(__eko_jpeg_enc_get_raw_duoview422_data_for_yuv422(f420.ctx.get()), 0u);
+    EXPECT_EQ(__eko_jpeg_enc_get_raw_duoview422_data(nullptr), 0u);
+    PackedContext f420(src, 8, 16, false);  // 4:2:2 rows would need 16 chroma rows of 8
+    EXPECT_EQ(__eko_jpeg_enc_get_raw_duoview422_data_for_yuv422(f420.ctx), 0u);
     EXPECT_EQ(f420.ctx->read_ptr, src);
-    EXPECT_EQ(f420.row(1, 0)[0], 0xEE);
+    EXPECT_EQ(f420.cells(1, 0), Bytes(8, 0xEE));
+}
+
+// Whole frames through initialisation, header, reader and coding pass per
+// band, end mark. Odd heights put a single row in the last 4:2:0 pair; odd
+// widths leave the last column to the edge repetition.
+TEST(Packed422Encode, DecodesCloseToTheSource) {
+    tekoj_test::FaultScope scope;
+    for (auto [w, h, keep422] : {std::tuple{96, 64, false}, {70, 45, false}, {2, 1, false}, {71, 33, true},
+                                 {64, 24, true}, {3, 5, true}}) {
+        const int groups = w / 2;  // smooth colour ramps
+        Bytes packed(size_t(h) * groups * 4);
+        for (int y = 0; y < h; ++y)
+            for (int k = 0; k < groups; ++k) {
+                uint8_t* g = &packed[(size_t(y) * groups + k) * 4];
+                g[0] = uint8_t(40 + 2 * k + y), g[1] = uint8_t(100 + k), g[2] = uint8_t(41 + 2 * k + y);
+                g[3] = uint8_t(150 - y);
+            }
+        Bytes jpeg;
+        {
+            PackedContext p(packed.data(), w, h, keep422);
+            ASSERT_NE(p.ctx, nullptr);
+            __eko_jpeg_enc_make_header(p.ctx);
+            for (uint32_t band = 0; band < p.ctx->total_imcu_rows; ++band) {
+                EXPECT_EQ(p.read(), 1u);
+                __eko_jpeg_enc_compress_data(p.ctx, p.ctx->sample_rows->row_arrays);
+                p.ctx->sample_rows->band_counter++;
+            }
+            EXPECT_EQ(p.ctx->read_ptr, packed.data() + packed.size()) << "the whole frame, not a byte more";
+            __eko_jpeg_enc_make_end_mark(p.ctx);
+            jpeg.assign(p.ctx->output->buffer, p.ctx->output->buffer + p.ctx->output->total);
+        }
+        const tekoj_test::Decoded d = tekoj_test::decode_jpeg(jpeg, true);
+        ASSERT_TRUE(d.ok && !d.warning) << w << "x" << h << ": " << d.message;
+        ASSERT_EQ(d.width * d.height, w * h);
+        Bytes luma;  // the source's Y, last column repeated for odd widths
+        for (int y = 0; y < h; ++y)
+            for (int x = 0; x < w; ++x) {
+                const int col = std::min(x, 2 * groups - 1);
+                luma.push_back(packed[(size_t(y) * groups + col / 2) * 4 + (col & 1) * 2]);
+            }
+        EXPECT_GT(tekoj_test::psnr(luma.data(), d.pixels.data(), luma.size()), 40.0) << w << "x" << h;
+    }
+    EXPECT_EQ(tekoj_test::live_blocks(), 0);
 }
 
 }  // namespace
