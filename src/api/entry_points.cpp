@@ -26,7 +26,8 @@ bool band_words_valid(const ImageInfo* info) {
     const int32_t bh = static_cast<int32_t>(band_height(info));
     if (info->band_open_end != 0 && info->height % bh != 0) return false;
     if (info->band_continued == 0) return info->total_height >= info->height && info->total_height <= 49999;
-    return info->band_top_row >= 0 && info->band_top_row % bh == 0;
+    // A later band follows at least one band, and starts on an MCU-row boundary.
+    return info->band_top_row > 0 && info->band_top_row % bh == 0;
 }
 
 enum class Outcome { CreationFailed, Failed, Done };
