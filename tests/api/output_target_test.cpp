@@ -1,6 +1,5 @@
-// Output target: byte writers, grow-by-copy, and memory targets that never
-// write past their capacity, grow geometrically and make room for the header
-// whatever block they start with.
+// Output target: grow-by-copy, and memory targets that never write past their
+// capacity and grow geometrically.
 #include <TekoJEncoder.h>
 
 #include "support/fault_os_layer.h"
@@ -60,19 +59,6 @@ Bytes finish(EncoderContext* ctx, AfterBand after_band) {
 }
 
 }  // namespace
-
-TEST(OutputTarget, ByteWritersAppendBigEndianNumbers) {
-    uint8_t buffer[8] = {};
-    OutputTarget t{EKO_OUTPUT_MEMORY, sizeof buffer, 0, 0, nullptr, buffer, nullptr, nullptr};
-    const uint16_t soi = 0xFFD8;
-    __eko_jpeg_enc_write_2bytes(&t, &soi);
-    const uint32_t sos_word = 0xFFDA;  // the address of a 32-bit word: its low 16 bits count
-    __eko_jpeg_enc_write_2bytes(&t, &sos_word);
-    const uint16_t dqt = 0xFFDB, length = 0x0043;
-    __eko_jpeg_enc_write_4bytes(&t, &dqt, &length);
-    EXPECT_EQ(t.used, 8u);
-    EXPECT_EQ(Bytes(buffer, buffer + 8), (Bytes{0xFF, 0xD8, 0xFF, 0xDA, 0xFF, 0xDB, 0x00, 0x43}));
-}
 
 TEST(OutputTarget, ReallocCopiesAndAlwaysFreesTheOldBlock) {
     FaultScope scope;
@@ -174,23 +160,4 @@ TEST(MemoryTarget, LargeImagesGrowInAFewSteps) {
     DORVATEKO_OsFree(buffer);
     EXPECT_GT(growths, 0);
     EXPECT_LE(growths, 25);
-}
-
-TEST(MemoryTarget, BlocksSmallerThanTheHeaderAreGrownBeforeIt) {
-    const Bytes px = rgb_to_format(photo_rgb(640, 480, 2), 640, 480, EKO_FORMAT_RGB888);
-    const ImageInfo info = image_info(px.data(), 640, 480, EKO_FORMAT_RGB888);
-    const Bytes expected = encode_to_memory(info, 75);
-    for (uint32_t capacity : {0u, 1u, 2u, 19u, 20u, 100u, 628u, 629u, 630u, 700u}) {
-        SCOPED_TRACE(capacity);
-        FaultScope scope;
-        const int64_t live = live_blocks();
-        EncoderContext* ctx = memory_context(info, capacity, 75);
-        ASSERT_NE(ctx, nullptr);
-        ASSERT_EQ(__eko_jpeg_enc_make_header(ctx), 1u);
-        EXPECT_EQ(ctx->output->used, 629u);
-        EXPECT_LE(ctx->output->used, ctx->output->capacity);
-        const Bytes stream = finish(ctx, [](const OutputTarget* t) { EXPECT_LE(t->used, t->capacity); });
-        EXPECT_EQ(stream, expected);
-        EXPECT_EQ(live_blocks(), live);
-    }
 }

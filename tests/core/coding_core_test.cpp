@@ -13,7 +13,6 @@
 #include <algorithm>
 #include <array>
 #include <bit>
-#include <cmath>
 #include <csetjmp>
 #include <cstring>
 #include <random>
@@ -27,13 +26,6 @@ namespace {
 constexpr uint8_t kZigzag[64] = {0,  1,  8,  16, 9,  2,  3,  10, 17, 24, 32, 25, 18, 11, 4,  5,  12, 19, 26, 33, 40, 48,
                                  41, 34, 27, 20, 13, 6,  7,  14, 21, 28, 35, 42, 49, 56, 57, 50, 43, 36, 29, 22, 15, 23,
                                  30, 37, 44, 51, 58, 59, 52, 45, 38, 31, 39, 46, 53, 60, 61, 54, 47, 55, 62, 63};
-constexpr uint8_t kAnnexK1[64] = {16, 11, 10, 16, 24,  40,  51,  61,  12, 12, 14, 19, 26,  58,  60,  55,
-                                  14, 13, 16, 24, 40,  57,  69,  56,  14, 17, 22, 29, 51,  87,  80,  62,
-                                  18, 22, 37, 56, 68,  109, 103, 77,  24, 35, 55, 64, 81,  104, 113, 92,
-                                  49, 64, 78, 87, 103, 121, 120, 101, 72, 92, 95, 98, 112, 100, 103, 99};
-constexpr uint8_t kAnnexK2Head[32] = {17, 18, 24, 47, 99, 99, 99, 99, 18, 21, 26, 66, 99, 99, 99, 99,
-                                      24, 26, 56, 99, 99, 99, 99, 99, 47, 66, 99, 99, 99, 99, 99, 99};
-
 // Segments of a stream's header, SOI first and SOS last, markers included.
 std::vector<Bytes> header_segments(const Bytes& j) {
     std::vector<Bytes> out{Bytes(j.begin(), j.begin() + 2)};
@@ -209,10 +201,12 @@ TEST(Header, RestartIntervalIsOneMcuRow) {
 }
 
 TEST(Quantisation, ExportedLevelZeroIsAnnexKAndDivisorsFollowIt) {
-    EXPECT_EQ(Bytes(eko_luminanceQuantTbl[0], eko_luminanceQuantTbl[0] + 64), Bytes(kAnnexK1, kAnnexK1 + 64));
-    Bytes k2(64, 99);
-    for (int i = 0; i < 32; ++i) k2[i] = kAnnexK2Head[i];
-    EXPECT_EQ(Bytes(eko_chrominanceQuantTbl[0], eko_chrominanceQuantTbl[0] + 64), k2);
+    // libjpeg-turbo's quality-50 tables are the Annex K tables.
+    const std::vector<Bytes> segs = header_segments(turbo_jpeg(photo_rgb(16, 16), 16, 16, 50, false));
+    for (int k = 0; k < 64; ++k) {
+        EXPECT_EQ(eko_luminanceQuantTbl[0][kZigzag[k]], segs[2][5 + k]) << k;
+        EXPECT_EQ(eko_chrominanceQuantTbl[0][kZigzag[k]], segs[3][5 + k]) << k;
+    }
     const struct {
         uint32_t quality;
         int index;
@@ -224,7 +218,7 @@ TEST(Quantisation, ExportedLevelZeroIsAnnexKAndDivisorsFollowIt) {
     }
 }
 
-TEST(ForwardDct, DefinedExamplesAndAgreementWithAFloatDct) {
+TEST(ForwardDct, DefinedExamples) {
     std::array<std::array<uint8_t, 32>, 8> samples;
     uint8_t* rows[8];
     for (int y = 0; y < 8; ++y) rows[y] = samples[y].data();
@@ -260,58 +254,30 @@ TEST(ForwardDct, DefinedExamplesAndAgreementWithAFloatDct) {
     EXPECT_EQ(transform(16, 0, divisors.data()), 16u);
     EXPECT_EQ(out[0][0], 0x5A5A);
 
-    // Random blocks against the exact DCT divided by the quantiser step: off by
-    // at most one step plus the fixed-point transform's small error.
-    for (uint32_t quality : {50u, 90u, 100u}) {
-        Coder coder(8, 8, EKO_FORMAT_GREY, quality);
-        std::mt19937 rng(quality);
-        double worst = 0;
-        for (int n = 0; n < 300; ++n) {
-            for (auto& r : samples)
-                for (auto& v : r) v = static_cast<uint8_t>(n % 3 ? rng() % 256 : 100 + rng() % 40);
-            transform(0, 1, coder.ctx->divisors[0]);
-            for (int v = 0; v < 8; ++v)
-                for (int u = 0; u < 8; ++u) {
-                    double sum = 0;
-                    for (int y = 0; y < 8; ++y)
-                        for (int x = 0; x < 8; ++x)
-                            sum += (samples[y][x] - 128.0) * std::cos((2 * x + 1) * u * M_PI / 16) *
-                                   std::cos((2 * y + 1) * v * M_PI / 16);
-                    const double f = sum * (u ? 1 : M_SQRT1_2) * (v ? 1 : M_SQRT1_2) / 4;
-                    // The step in DCT units: the reciprocal divisor over the scale
-                    // 8 s(u) s(v), s(0) = 1, s(k) = sqrt(2) cos(k pi / 16).
-                    auto scale = [](int k) { return k ? M_SQRT2 * std::cos(k * M_PI / 16) : 1.0; };
-                    const double step = 65536.0 / coder.ctx->divisors[0][8 * v + u] / (8 * scale(u) * scale(v));
-                    worst = std::max(worst, (std::abs(out[0][8 * v + u] - f / step) - 1) * step);
-                }
-        }
-        EXPECT_LT(worst, 4.0) << quality;  // DCT units beyond the quantiser's own rounding
-    }
 }
 
 TEST(Huffman, CodeTablesAndMagnitudeCategories) {
     Coder coder(16, 16, EKO_FORMAT_YUV420);
     const EntropyState* es = coder.ctx->entropy;
-    const AcCodeTable& luma = *es->ac_codes[0];
-    const AcCodeTable& chroma = *es->ac_codes[1];
     const struct {
-        const AcCodeTable* table;
-        int symbol, code, size;
-    } ac[] = {{&luma, 0x00, 10, 4},  {&luma, 0xF0, 2041, 11}, {&luma, 0x01, 0, 2},    {&luma, 0x02, 1, 2},
-              {&luma, 0x0B, -1, 0},  {&chroma, 0x00, 0, 2},   {&chroma, 0xF0, 1018, 10}, {&chroma, 0x0B, -1, 0}};
-    for (const auto& c : ac) {
-        SCOPED_TRACE(c.symbol);
-        EXPECT_EQ(c.table->size[c.symbol], c.size);
-        if (c.code >= 0) {
-            EXPECT_EQ(c.table->code[c.symbol], c.code);
-        }
+        const uint16_t* code;
+        const uint8_t* size;
+        int symbol, expected_code, expected_size;
+    } cases[] = {{es->ac_codes[0]->code, es->ac_codes[0]->size, 0x00, 10, 4},  // EOB 1010
+                 {es->ac_codes[0]->code, es->ac_codes[0]->size, 0xF0, 2041, 11},
+                 {es->ac_codes[0]->code, es->ac_codes[0]->size, 0x01, 0, 2},
+                 {es->ac_codes[0]->code, es->ac_codes[0]->size, 0x02, 1, 2},
+                 {es->ac_codes[1]->code, es->ac_codes[1]->size, 0x00, 0, 2},
+                 {es->ac_codes[1]->code, es->ac_codes[1]->size, 0xF0, 1018, 10},
+                 {es->dc_codes[0]->code, es->dc_codes[0]->size, 0, 0, 2},
+                 {es->dc_codes[0]->code, es->dc_codes[0]->size, 11, 510, 9},
+                 {es->dc_codes[1]->code, es->dc_codes[1]->size, 11, 2046, 11}};
+    for (const auto& c : cases) {
+        EXPECT_EQ(c.size[c.symbol], c.expected_size) << c.symbol;
+        EXPECT_EQ(c.code[c.symbol], c.expected_code) << c.symbol;
     }
-    EXPECT_EQ(es->dc_codes[0]->code[0], 0);
-    EXPECT_EQ(es->dc_codes[0]->size[0], 2);
-    EXPECT_EQ(es->dc_codes[0]->code[11], 510);
-    EXPECT_EQ(es->dc_codes[0]->size[11], 9);
-    EXPECT_EQ(es->dc_codes[1]->code[11], 2046);
-    EXPECT_EQ(es->dc_codes[1]->size[11], 11);
+    EXPECT_EQ(es->ac_codes[0]->size[0x0B], 0);  // not in the specification
+    EXPECT_EQ(es->ac_codes[1]->size[0x0B], 0);
     for (uint32_t v = 0; v < 4096; ++v) ASSERT_EQ(coder.ctx->nbits_table[v], std::bit_width(v)) << v;
 }
 
@@ -358,28 +324,6 @@ TEST(BitWriter, StuffingPaddingAndRestartStep) {
     }
 }
 
-TEST(BlockCoder, DefinedBitPatterns) {
-    // One grey block after the 334-byte header: DC difference, then EOB.
-    const struct {
-        int16_t dc;
-        Bytes data;
-    } cases[] = {{0, {0x2B}}, {-3, {0x65, 0x7F}}, {3, {0x7D, 0x7F}}};
-    for (const auto& c : cases) {
-        Coder coder(8, 8, EKO_FORMAT_GREY);
-        ASSERT_EQ(__eko_jpeg_enc_make_header(coder.ctx), 1u);
-        int16_t* blk = coder.ctx->mcu_state->mcu_buffer[0];
-        std::memset(blk, 0, 128);
-        blk[0] = c.dc;
-        blk[63] = 5;  // zig-zag position 63 is never coded, and is 0 afterwards
-        ASSERT_EQ(__eko_jpeg_enc_encode_1mcu_blk(coder.ctx, coder.ctx->mcu_state->mcu_buffer), 1u);
-        EXPECT_EQ(blk[63], 0);
-        ASSERT_EQ(__eko_jpeg_enc_make_end_mark(coder.ctx), 1u);
-        Bytes expected = c.data;
-        expected.insert(expected.end(), {0xFF, 0xD9});
-        EXPECT_EQ(coder.written(334), expected) << c.dc;
-    }
-}
-
 TEST(BlockCoder, CoefficientsReadBackByLibjpeg) {
     // Random and extreme MCUs coded through the exported block coder, read
     // back as coefficients: position 63 comes back 0, AC values beyond the
@@ -389,8 +333,8 @@ TEST(BlockCoder, CoefficientsReadBackByLibjpeg) {
         uint32_t format;
         int w, h;
         uint32_t kind;
-    } cases[] = {{EKO_FORMAT_GREY, 24, 24, EKO_OUTPUT_MEMORY}, {EKO_FORMAT_YUV420, 48, 32, EKO_OUTPUT_MEMORY},
-                 {EKO_FORMAT_YUV420, 64, 48, EKO_OUTPUT_STREAM}};
+    } cases[] = {{EKO_FORMAT_GREY, 64, 64, EKO_OUTPUT_MEMORY}, {EKO_FORMAT_YUV420, 128, 96, EKO_OUTPUT_MEMORY},
+                 {EKO_FORMAT_YUV420, 128, 64, EKO_OUTPUT_STREAM}};
     for (const auto& c : cases) {
         SCOPED_TRACE(c.w);
         const Bytes pixels(image_size(c.format, c.w, c.h), 0);
@@ -414,11 +358,13 @@ TEST(BlockCoder, CoefficientsReadBackByLibjpeg) {
             int16_t* const* blocks = ctx->mcu_state->mcu_buffer;
             for (uint32_t b = 0; b < ctx->blocks_in_mcu; ++b) {
                 std::array<int16_t, 64> expect{};
-                const int style = static_cast<int>((m + b) % 5);
+                // Every third MCU is all worst-case blocks: the longest codes
+                // with all-ones extra bits, the most stuffed FF bytes.
+                const int style = m % 3 == 0 ? 1 : static_cast<int>((m + b) % 4);
                 for (int k = 0; k < 64; ++k) {
                     int v = 0;
                     if (style == 0) v = (k % 2 ? 1 : -1) * (2000 + k);  // beyond category 10
-                    if (style == 1) v = k % 2 ? 1023 : -1023;          // longest codes, many FF bytes
+                    if (style == 1) v = 1023;
                     if (style == 2 && rng() % 6 == 0) v = static_cast<int>(rng() % 201) - 100;
                     if (style == 3 && (k == 21 || k == 63)) v = -1;     // a run of 20, then the last position
                     if (k == 0) v = static_cast<int>(rng() % 2041) - 1024;
