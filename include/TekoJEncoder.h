@@ -374,6 +374,9 @@ EKO_API uint32_t eko_enc_jpeg_to_stream_ex(const ImageInfo* image_info, EkoStrea
 /* MCU-row interface                                                         */
 /* ------------------------------------------------------------------------ */
 
+/* A successful init owns the memory block of a kind-1 request until
+ * eko_jpeg_enc_mcu_finish hands the stream back (null and 0 when the encode
+ * failed, the block then released). */
 EKO_API EncoderContext* eko_jpeg_enc_mcu_init(const ImageInfo* image_info, const OutputRequest* output_request,
                                               const EncodeOptions* options, const EncoderSettings* settings);
 EKO_API uint32_t eko_jpeg_enc_muc_process(EncoderContext* context, const uint8_t* band, uint32_t* next_row_out);
@@ -382,8 +385,10 @@ EKO_API uint32_t eko_jpeg_enc_col_muc_process(EncoderContext* context, const uin
 EKO_API uint8_t* eko_jpeg_enc_mcu__get_encdata(EncoderContext* context, uint8_t** buffer_out,
                                                uint32_t* length_out);
 EKO_API void eko_jpeg_enc_mcu_finish(EncoderContext* context, uint8_t** buffer_out, uint32_t* length_out);
-/* Installs a stream callback on a context created with kind 4, before its
- * first band. */
+/* Installs the stream callback (non-null) and its argument (may be null) on
+ * a context created with kind 4. Refused (error 23) once anything has been
+ * coded or handed on; band, driver and column-split calls on a kind-4 context
+ * are refused until it is installed. */
 EKO_API uint32_t eko_jpeg_enc_mcu_set_stream(EncoderContext* context, EkoStreamCallback callback,
                                              void* callback_arg);
 
