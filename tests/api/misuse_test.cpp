@@ -95,7 +95,7 @@ TEST(Misuse, NullArgumentsAndUnusableTargetsAreRefused) {
     // Memory calls: `expect_null` after a failed creation (the block stays the
     // caller's), otherwise the caller's variables unchanged.
     auto memory = [&](int32_t length, bool expect_null, auto call) {
-        return [=, &arg] {
+        return [=] {
             uint8_t* const block = length > 0 ? static_cast<uint8_t*>(DORVATEKO_OsMalloc(length)) : mark;
             uint8_t* buffer = block;
             int32_t len = length;
