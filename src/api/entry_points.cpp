@@ -100,6 +100,26 @@ uint32_t refuse() {
     return 0;
 }
 
+// The buffer members' common run. A refused or failed creation hands back
+// null and 0 without freeing the caller's block, which the caller still
+// holds; a block that the library itself (re)allocated for the call
+// (`owns_block`) would be lost that way, so it is freed instead.
+uint32_t to_buffer(const ImageInfo* info, uint8_t** buffer_io, int32_t* length_io, const EncodeOptions* options,
+                   bool owns_block) {
+    if (buffer_io == nullptr || length_io == nullptr) return refuse();
+    Result r{Outcome::CreationFailed, nullptr, 0};
+    if (info == nullptr || *length_io < 0 || !band_words_valid(info)) {
+        eko_SetError(EKO_ERR_ARGUMENT);
+    } else {
+        const OutputRequest request{EKO_OUTPUT_MEMORY, nullptr, *buffer_io, static_cast<uint32_t>(*length_io)};
+        r = run(info, request, options, nullptr, nullptr, true);
+    }
+    if (r.outcome == Outcome::CreationFailed && owns_block && *buffer_io != nullptr) DORVATEKO_OsFree(*buffer_io);
+    *buffer_io = r.buffer;
+    *length_io = static_cast<int32_t>(r.total);
+    return r.outcome == Outcome::Done ? 1 : 0;
+}
+
 }  // namespace
 }  // namespace tekoj
 
@@ -132,24 +152,13 @@ EKO_API uint32_t eko_enc_jpeg_to_file_full_buffer(const ImageInfo* image_info, O
 
 EKO_API uint32_t eko_enc_jpeg_to_buffer_ex(const ImageInfo* image_info, uint8_t** buffer_io, int32_t* length_io,
                                            const EncodeOptions* options) {
-    using namespace tekoj;
-    if (buffer_io == nullptr || length_io == nullptr) return refuse();
-    if (image_info == nullptr || *length_io < 0 || !band_words_valid(image_info)) {
-        // Refused like a failed creation: nothing written, the block not freed.
-        *buffer_io = nullptr;
-        *length_io = 0;
-        return refuse();
-    }
-    OutputRequest request{EKO_OUTPUT_MEMORY, nullptr, *buffer_io, static_cast<uint32_t>(*length_io)};
-    const Result r = run(image_info, request, options, nullptr, nullptr, true);
-    *buffer_io = r.buffer;
-    *length_io = static_cast<int32_t>(r.total);
-    return r.outcome == Outcome::Done ? 1 : 0;
+    return tekoj::to_buffer(image_info, buffer_io, length_io, options, false);
 }
 
 EKO_API uint32_t eko_enc_jpeg_to_buffer(const ImageInfo* image_info, uint8_t** buffer_io, int32_t* length_io,
                                         uint32_t quality) {
     if (buffer_io == nullptr || length_io == nullptr || *length_io < 0) return tekoj::refuse();
+    bool replaced = false;
     if (*length_io < static_cast<int32_t>(tekoj::kMinMemoryBlock)) {
         void* grown = DORVATEKO_OsRealloc(*buffer_io, tekoj::kMinMemoryBlock);
         if (grown == nullptr) {
@@ -159,9 +168,10 @@ EKO_API uint32_t eko_enc_jpeg_to_buffer(const ImageInfo* image_info, uint8_t** b
         }
         *buffer_io = static_cast<uint8_t*>(grown);
         *length_io = static_cast<int32_t>(tekoj::kMinMemoryBlock);
+        replaced = true;
     }
     const EncodeOptions options{quality, nullptr, 0};
-    return eko_enc_jpeg_to_buffer_ex(image_info, buffer_io, length_io, &options);
+    return tekoj::to_buffer(image_info, buffer_io, length_io, &options, replaced);
 }
 
 EKO_API uint32_t eko_enc_jpeg_to_buffer_ex_full_buffer(const ImageInfo* image_info, OutputRequest* request,
