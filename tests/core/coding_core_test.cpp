@@ -276,7 +276,7 @@ TEST(Huffman, CodeTablesAndMagnitudeCategories) {
         EXPECT_EQ(c.size[c.symbol], c.expected_size) << c.symbol;
         EXPECT_EQ(c.code[c.symbol], c.expected_code) << c.symbol;
     }
-    EXPECT_EQ(es->ac_codes[0]->size[0x0B], 0);  // not in the specification
+    EXPECT_EQ(es->ac_codes[0]->size[0x0B], 0);  // a symbol without a code
     EXPECT_EQ(es->ac_codes[1]->size[0x0B], 0);
     for (uint32_t v = 0; v < 4096; ++v) ASSERT_EQ(coder.ctx->nbits_table[v], std::bit_width(v)) << v;
 }
