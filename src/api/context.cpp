@@ -1,5 +1,6 @@
 // Encoder context: creation validates the caller's records and allocates
 // every working buffer of one encode; release frees them again.
+#include "api/context.h"
 #include "api/output_target.h"
 #include "core/entropy_coder.h"
 
@@ -43,6 +44,14 @@ bool settings_usable(const EncoderContext* ctx) {
 }
 
 }  // namespace
+
+void discard_context(EncoderContext* ctx) {
+    if (ctx->work_buffer != nullptr) DORVATEKO_OsFree(ctx->work_buffer);
+    ctx->work_buffer = nullptr;
+    __eko_jpeg_enc_release_mem(ctx);
+    DORVATEKO_OsFree(ctx);
+}
+
 }  // namespace tekoj
 
 extern "C" {

@@ -1,6 +1,7 @@
 // Whole-image entry points: one call creates an encoder, writes the header,
 // codes the image band by band, completes the stream and releases
 // everything. The buffer member also codes single bands of a larger image.
+#include "api/context.h"
 #include "api/output_target.h"
 #include "core/band_driver.h"
 
@@ -8,15 +9,6 @@ namespace tekoj {
 namespace {
 
 constexpr uint32_t kMinMemoryBlock = 2048;
-
-// Throws away a context whose encode did not complete: the work buffer too,
-// which only completion would otherwise free.
-void discard(EncoderContext* ctx) {
-    if (ctx->work_buffer != nullptr) DORVATEKO_OsFree(ctx->work_buffer);
-    ctx->work_buffer = nullptr;
-    __eko_jpeg_enc_release_mem(ctx);
-    DORVATEKO_OsFree(ctx);
-}
 
 uint32_t band_height(const ImageInfo* info) { return (info->format & 0xFF) == EKO_FORMAT_GREY ? 8 : 16; }
 
@@ -84,7 +76,7 @@ Result run(const ImageInfo* info, const OutputRequest& request, const EncodeOpti
             DORVATEKO_OsFree(ctx->output->buffer);
         }
     }
-    discard(ctx);
+    discard_context(ctx);
     return r;
 }
 

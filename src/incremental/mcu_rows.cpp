@@ -7,6 +7,7 @@
 // back no stream. Calls refused for misuse (a band after the last one, a
 // stream target without its callback) write nothing and leave the encode as
 // it was.
+#include "api/context.h"
 #include "api/output_target.h"
 #include "core/band_driver.h"
 #include "incremental/incremental.h"
@@ -91,12 +92,7 @@ void release_row_streams(EncoderContext* ctx) {
 
 void release_context(EncoderContext* ctx) {
     release_row_streams(ctx);
-    // Completion frees the work buffer; an encode that never completed
-    // still holds it.
-    if (ctx->work_buffer != nullptr) DORVATEKO_OsFree(ctx->work_buffer);
-    ctx->work_buffer = nullptr;
-    __eko_jpeg_enc_release_mem(ctx);
-    DORVATEKO_OsFree(ctx);
+    discard_context(ctx);
 }
 
 }  // namespace tekoj
