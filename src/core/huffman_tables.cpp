@@ -1,4 +1,4 @@
-// Huffman tables: the standard specifications, the derived code tables the
+// Huffman tables: the four standard tables (code counts and symbols), the derived code tables the
 // block coder looks codes up in, and the magnitude-category table.
 #include "core/huffman_tables.h"
 
