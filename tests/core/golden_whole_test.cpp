@@ -1,104 +1,62 @@
 // Exact-byte checks of whole-image and band-mode streams against the stored
-// golden outputs.
+// golden outputs (tests/data/golden; each name gives format, size and quality).
 #include "support/test_support.h"
 
 #include <gtest/gtest.h>
-
-#include <fstream>
-#include <regex>
-#include <sstream>
 
 using namespace tekoj_test;
 
 namespace {
 
 struct GoldenCase {
-    std::string name, kind;
-    uint32_t format = 0, quality = 0;
-    int width = 0, height = 0;
-    std::vector<int> band_heights;
+    const char* name;
+    uint32_t format;
+    int width, height;
+    uint32_t quality;
 };
 
-// The cases file is a flat JSON list; the fields we need are scalars and one
-// integer list, which a few regular expressions read reliably.
-std::vector<GoldenCase> load_cases(const std::string& kind_filter) {
-    std::ifstream f(golden_path("cases.json"));
-    std::stringstream ss;
-    ss << f.rdbuf();
-    const std::string text = ss.str();
-    std::vector<GoldenCase> out;
-    size_t pos = 0;
-    while ((pos = text.find("\"name\"", pos)) != std::string::npos) {
-        size_t end = text.find("\"name\"", pos + 1);
-        const std::string obj = text.substr(pos, end == std::string::npos ? std::string::npos : end - pos);
-        auto field = [&](const char* key) {
-            std::smatch m;
-            std::regex re(std::string("\"") + key + "\": ?(\"([^\"]*)\"|(-?[0-9]+))");
-            if (!std::regex_search(obj, m, re)) return std::string();
-            return m[2].matched ? m[2].str() : m[3].str();
-        };
-        GoldenCase c;
-        c.name = field("name");
-        c.kind = field("kind");
-        if (c.kind == kind_filter) {
-            c.format = static_cast<uint32_t>(std::stoul(field("format")));
-            c.width = std::stoi(field("width"));
-            c.height = std::stoi(field("height"));
-            c.quality = static_cast<uint32_t>(std::stoul(field("quality")));
-            std::smatch m;
-            if (std::regex_search(obj, m, std::regex("\"band_heights\":\\s*\\[([0-9,\\s]*)\\]"))) {
-                std::stringstream list(m[1].str());
-                std::string item;
-                while (std::getline(list, item, ',')) c.band_heights.push_back(std::stoi(item));
-            }
-            out.push_back(c);
-        }
-        pos += 1;
-    }
-    return out;
-}
+constexpr GoldenCase kWhole[] = {
+    {"whole-yuv420-17x20-q75-pattern", EKO_FORMAT_YUV420, 17, 20, 75},
+    {"whole-grey-33x17-q50-pattern", EKO_FORMAT_GREY, 33, 17, 50},
+    {"whole-rgb565-33x17-q90-pattern", EKO_FORMAT_RGB565, 33, 17, 90},
+    {"whole-rgb888-17x20-q100-pattern", EKO_FORMAT_RGB888, 17, 20, 100},
+    {"whole-rgba8888-7x5-q1-pattern", EKO_FORMAT_RGBA8888, 7, 5, 1},
+    {"whole-bgra8888-64x48-q75-pattern", EKO_FORMAT_BGRA8888, 64, 48, 75},
+    {"whole-rgb888-96x64-q85-photo", EKO_FORMAT_RGB888, 96, 64, 85},
+    {"whole-yuv420-100x75-q90-photo", EKO_FORMAT_YUV420, 100, 75, 90},
+    {"whole-grey-1x1-q75-pattern", EKO_FORMAT_GREY, 1, 1, 75},
+    {"whole-rgb565-1x7-q75-pattern", EKO_FORMAT_RGB565, 1, 7, 75},
+    {"whole-rgb565-50x33-q60-photo", EKO_FORMAT_RGB565, 50, 33, 60},
+    {"whole-bgra8888-31x9-q95-photo", EKO_FORMAT_BGRA8888, 31, 9, 95},
+};
 
 }  // namespace
 
 TEST(GoldenWhole, EveryCaseMatchesByteForByte) {
-    const auto cases = load_cases("whole");
-    ASSERT_FALSE(cases.empty());
-    for (const auto& c : cases) {
+    for (const GoldenCase& c : kWhole) {
         SCOPED_TRACE(c.name);
-        const Bytes input = read_file(golden_path(c.name + ".in"));
-        const Bytes expected = read_file(golden_path(c.name + ".expected"));
+        const Bytes input = read_file(golden_path(std::string(c.name) + ".in"));
         ASSERT_EQ(input.size(), image_size(c.format, c.width, c.height));
-        const ImageInfo info = image_info(input.data(), c.width, c.height, c.format);
-        const Bytes got = encode_to_memory(info, c.quality);
-        ASSERT_EQ(got.size(), expected.size());
-        EXPECT_TRUE(got == expected);
+        const Bytes got = encode_to_memory(image_info(input.data(), c.width, c.height, c.format), c.quality);
+        EXPECT_TRUE(got == read_file(golden_path(std::string(c.name) + ".expected")));
     }
 }
 
 TEST(GoldenWhole, BandsJoinToTheExpectedStream) {
-    const auto cases = load_cases("bands");
-    ASSERT_FALSE(cases.empty());
-    for (const auto& c : cases) {
-        SCOPED_TRACE(c.name);
-        const Bytes input = read_file(golden_path(c.name + ".in"));
-        const Bytes expected = read_file(golden_path(c.name + ".expected"));
-        const int bpp = bytes_per_pixel(c.format);
-        Bytes joined;
-        int top = 0;
-        for (size_t b = 0; b < c.band_heights.size(); ++b) {
-            ImageInfo info = image_info(input.data() + static_cast<size_t>(top) * c.width * bpp, c.width,
-                                        c.band_heights[b], c.format);
-            info.band_mode = 1;
-            info.band_continued = b > 0;
-            info.band_open_end = b + 1 < c.band_heights.size();
-            info.total_height = c.height;
-            info.band_top_row = top;
-            const Bytes piece = encode_to_memory(info, c.quality);
-            ASSERT_FALSE(piece.empty());
-            joined.insert(joined.end(), piece.begin(), piece.end());
-            top += c.band_heights[b];
-        }
-        ASSERT_EQ(joined.size(), expected.size());
-        EXPECT_TRUE(joined == expected);
+    const std::string name = "bands-rgb888-64x40-q80-16-16-8";
+    const Bytes input = read_file(golden_path(name + ".in"));
+    const int width = 64, height = 40, bands[] = {16, 16, 8};
+    Bytes joined;
+    for (int b = 0, top = 0; b < 3; top += bands[b++]) {
+        ImageInfo info = image_info(input.data() + size_t(top) * width * 3, width, bands[b], EKO_FORMAT_RGB888);
+        info.band_mode = 1;
+        info.band_continued = b > 0;
+        info.band_open_end = b < 2;
+        info.total_height = height;
+        info.band_top_row = top;
+        const Bytes piece = encode_to_memory(info, 80);
+        ASSERT_FALSE(piece.empty());
+        joined.insert(joined.end(), piece.begin(), piece.end());
     }
+    EXPECT_TRUE(joined == read_file(golden_path(name + ".expected")));
 }
