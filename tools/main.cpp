@@ -310,6 +310,7 @@ int main(int argc, char** argv) {
         }
     }
 
+    remove_temporaries_on_signals();
     Progress progress(jobs.size());
     int status = 0;
     for (size_t i = 0; i < jobs.size(); ++i) {
