@@ -2,7 +2,7 @@
 // with owned results, RAII for the incremental encoder and error messages.
 #pragma once
 
-#include <TekoJEncoder.h>
+#include <TekoJEncoderInternal.h>
 
 #include <cstdint>
 #include <string_view>
@@ -72,7 +72,7 @@ inline uint32_t append(void* arg, const uint8_t* data, uint32_t count) {
 }
 inline uint32_t failure_code() {
     const uint32_t code = eko_GetLastError();
-    return code == EKO_OK ? EKO_ERR_ARGUMENT : code;
+    return code == EKO_OK ? static_cast<uint32_t>(EKO_ERR_ARGUMENT) : code;
 }
 }  // namespace detail
 
@@ -93,7 +93,7 @@ inline Encoded encode(const Image& image, uint32_t quality) {
 inline uint32_t encode_to_file(const Image& image, const char* path, uint32_t quality) {
     const ImageInfo info = image.info();
     eko_SetError(EKO_OK);
-    return eko_enc_jpeg_to_file(&info, path, quality) == 1 ? EKO_OK : detail::failure_code();
+    return eko_enc_jpeg_to_file(&info, path, quality) == 1 ? static_cast<uint32_t>(EKO_OK) : detail::failure_code();
 }
 
 // Incremental encoder: one band (MCU row) per call, into memory. The stream

@@ -2,7 +2,7 @@
 // reports the reason, leaks no block, closes its file and leaves the caller's
 // variables as its failure rows say; the first call that is let through
 // gives the normal stream.
-#include <TekoJEncoder.h>
+#include <TekoJEncoderInternal.h>
 
 #include "support/fault_os_layer.h"
 #include "support/test_support.h"
