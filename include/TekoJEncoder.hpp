@@ -247,6 +247,15 @@ bool call_sink(void* sink, const uint8_t* data, size_t size) {
     }
 }
 
+// A null function pointer is refused before anything is coded.
+template <class Sink>
+bool null_sink(const Sink& sink) {
+    if constexpr (std::is_pointer_v<Sink>)
+        return sink == nullptr;
+    else
+        return false;
+}
+
 template <class Sink>
 SinkState make_sink(Sink& sink) {
     SinkState state;
@@ -626,6 +635,7 @@ public:
     }
     template <class Sink>
     void encode_to(const ImageView& view, Sink&& sink) const {
+        if (detail::null_sink(sink)) throw Error(EKO_ERR_ARGUMENT);
         detail::SinkState state = detail::make_sink(sink);
         const uint32_t code = run(view, state);
         if (state.exception) std::rethrow_exception(state.exception);
@@ -659,6 +669,7 @@ public:
     }
     template <class Sink>
     uint32_t try_encode_to(const ImageView& view, Sink&& sink) const noexcept {
+        if (detail::null_sink(sink)) return EKO_ERR_ARGUMENT;
         detail::SinkState state = detail::make_sink(sink);
         return run(view, state);
     }

@@ -192,6 +192,9 @@ TEST(CppApi, RefusalsBecomeErrorsWithCodeAndMessage) {
         EXPECT_EQ(r.error, c.code);
         EXPECT_TRUE(r.bytes.empty());
     }
+    void (*no_sink)(const uint8_t*, size_t) = nullptr;
+    EXPECT_EQ(enc.try_encode_to(ImageView(rgb.data(), 40, 30, PixelFormat::rgb888), no_sink),
+              uint32_t(EKO_ERR_ARGUMENT));
     EXPECT_THROW(enc.quality(0), tekoj::Error);
     EXPECT_THROW(enc.quality(101), tekoj::Error);
 }
