@@ -48,8 +48,7 @@ extern "C" {
 /* Errors                                                                    */
 /* ------------------------------------------------------------------------ */
 
-/* Why a call failed. The code is kept per thread and a successful call does
- * not reset it: read it right after a call returned 0 (or null). */
+/* Why a call failed, kept per thread (eko_GetLastError). */
 typedef enum EkoError {
     EKO_OK = 0,
     EKO_ERR_ALLOC = 3,        /* an allocation failed */
@@ -61,10 +60,13 @@ typedef enum EkoError {
     EKO_ERR_WRITE = 21,       /* the file refused bytes (disc full, I/O error) */
     EKO_ERR_TOO_LARGE = 22,   /* the stream passes 4 GiB, or the EXIF segment
                                  (thumbnail included) its 64 KB length field */
-    EKO_ERR_STATE = 23        /* call out of order (e.g. a band after the last) */
+    EKO_ERR_STATE = 23,       /* call out of order (e.g. a band after the last) */
+    EKO_ERR_OPEN = 24         /* the output file could not be opened */
 } EkoError;
 
-/* The code of the last failure on the calling thread (EKO_OK if none). */
+/* The reason of the last call on the calling thread: every exported call
+ * that can fail starts from EKO_OK, so after a success this is 0 and after a
+ * failure the code belongs to that call. */
 EKO_API uint32_t eko_GetLastError(void);
 
 /* TEKOJ_VERSION of the library actually loaded (major * 10000 + minor * 100
@@ -285,9 +287,11 @@ EKO_API int32_t DORVATEKO_OsFclose(void* file);
  * one scan with a restart marker after every MCU row, EOI. Members named _ex
  * take an EncodeOptions record, the others a bare quality.
  *
- * To a file: file_name is opened ("wb"), written and closed. On failure the
- * file is closed but not removed. The _full_buffer members take the handle in
- * request->file instead and close it too, in every case. */
+ * To a file: file_name is opened ("wb"), written and closed. Refused
+ * arguments are caught before the open and leave no file; a file that cannot
+ * be opened gives EKO_ERR_OPEN; after a later failure the file is closed but
+ * not removed. The _full_buffer members take the handle in request->file
+ * instead and close it too, in every case. */
 EKO_API uint32_t eko_enc_jpeg_to_file(const ImageInfo* image_info, const char* file_name, uint32_t quality);
 EKO_API uint32_t eko_enc_jpeg_to_file_ex(const ImageInfo* image_info, const char* file_name,
                                          const EncodeOptions* options);
@@ -303,10 +307,21 @@ EKO_API uint32_t eko_enc_jpeg_to_file_ex_full_buffer(const ImageInfo* image_info
  * *length_io; the caller frees it with DORVATEKO_OsFree.
  * eko_enc_jpeg_to_buffer first enlarges a block smaller than 2048 bytes
  * (a null block with length 0 is fine); a negative length is refused.
- * On failure *buffer_io is null and *length_io 0. A block that the encode
- * had begun to fill, or that the call itself enlarged, has been freed; a
- * block refused before that (bad arguments, creation failed) is still the
- * caller's to free, so keep a copy of the pointer. */
+ *
+ * Ownership of the memory block after the buffer members (and the request's
+ * block of the _full_buffer members) return:
+ *  - 1: the variables hold the stream's block, which may differ from the one
+ *    passed in (that one has then been freed), and the stream's length; the
+ *    caller frees the block with DORVATEKO_OsFree.
+ *  - 0 with a non-null block: the call was refused or creation failed before
+ *    any byte was written. The caller's variables are as they were, and the
+ *    block is still the caller's. (eko_enc_jpeg_to_buffer first enlarges a
+ *    block shorter than 2048 bytes; after that the variables hold the
+ *    enlarged block and 2048.)
+ *  - 0 with null and 0: the encode failed while writing (the block could not
+ *    grow, or the stream outgrew its length field); the library has already
+ *    freed the block. Nothing is left to free.
+ * So a non-null block after any result is the caller's to free. */
 EKO_API uint32_t eko_enc_jpeg_to_buffer(const ImageInfo* image_info, uint8_t** buffer_io, int32_t* length_io,
                                         uint32_t quality);
 EKO_API uint32_t eko_enc_jpeg_to_buffer_ex(const ImageInfo* image_info, uint8_t** buffer_io, int32_t* length_io,

@@ -55,6 +55,7 @@ inline std::string_view error_message(uint32_t code) noexcept {
         case EKO_ERR_WRITE: return "writing the output failed";
         case EKO_ERR_TOO_LARGE: return "output larger than its length field can describe";
         case EKO_ERR_STATE: return "call out of order";
+        case EKO_ERR_OPEN: return "the output file could not be opened";
         default: return "unknown error";
     }
 }
@@ -676,7 +677,7 @@ public:
     uint32_t try_encode_to_file(const ImageView& view, const std::string& path) const noexcept {
         if (const uint32_t bad = detail::check_view(view); bad != EKO_OK) return bad;
         std::FILE* file = std::fopen(path.c_str(), "wb");
-        if (file == nullptr) return EKO_ERR_WRITE;
+        if (file == nullptr) return EKO_ERR_OPEN;
         auto sink = [file](const uint8_t* data, size_t size) { return std::fwrite(data, 1, size, file) == size; };
         detail::SinkState state = detail::make_sink(sink);
         uint32_t code = run(view, state);

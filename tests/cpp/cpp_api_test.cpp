@@ -227,7 +227,7 @@ TEST(CppApi, FailingSinksStopTheEncode) {
 
     // A file that cannot be created, and one on a full device: error, and
     // nothing left behind.
-    EXPECT_EQ(enc.try_encode_to_file(view, "/nonexistent-dir/out.jpg"), uint32_t(EKO_ERR_WRITE));
+    EXPECT_EQ(enc.try_encode_to_file(view, "/nonexistent-dir/out.jpg"), uint32_t(EKO_ERR_OPEN));
     if (tekoj_test::file_exists("/dev/full")) {
         EXPECT_THROW(enc.encode_to_file(view, "/dev/full"), tekoj::Error);
     }
