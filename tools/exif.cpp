@@ -167,8 +167,10 @@ void attach_thumbnail(Exif& exif, const Thumbnail& thumbnail, bool grey) {
     image.height = static_cast<int32_t>(thumbnail.height);
     image.data = pixels.data();
     image.format = grey ? EKO_FORMAT_GREY : EKO_FORMAT_RGB888;
+    // The segment without thumbnail bytes; they add themselves and the
+    // 12-byte IFD1 entry that records their length.
     exif.set_thumbnail({}, thumbnail.width, thumbnail.height);
-    const size_t room = 65535 - (exif.segment().size() - 2);
+    const size_t room = 65535 - (exif.segment().size() - 2) - 12;
     for (uint32_t quality : {80u, 60u, 40u, 20u, 5u}) {
         std::vector<uint8_t> jpeg = encode_to_memory(image, quality);
         if (jpeg.size() <= room) {

@@ -4,7 +4,13 @@
 
 #include "tool.h"
 
+// The tool also drives exported internal steps: the readers that no format
+// code selects, and creation for planar 4:4:4.
+#if __has_include(<TekoJEncoderInternal.h>)
+#include <TekoJEncoderInternal.h>
+#else
 #include <TekoJEncoder.h>
+#endif
 
 namespace tool {
 

@@ -4,6 +4,7 @@
 #include "tool.h"
 
 #include <cerrno>
+#include <csignal>
 #include <cstdlib>
 #include <cstring>
 #include <fcntl.h>
@@ -11,6 +12,31 @@
 #include <unistd.h>
 
 namespace tool {
+namespace {
+
+// The temporary being written, for the signal handler: an interrupted run
+// leaves no half-written file behind either.
+char interrupted_temporary[4096];
+volatile sig_atomic_t temporary_set = 0;
+
+void remember_temporary(const std::string& path) {
+    temporary_set = 0;
+    if (path.size() >= sizeof interrupted_temporary) return;
+    std::memcpy(interrupted_temporary, path.c_str(), path.size() + 1);
+    temporary_set = 1;
+}
+
+void on_signal(int signal_number) {
+    if (temporary_set != 0) ::unlink(interrupted_temporary);
+    std::signal(signal_number, SIG_DFL);
+    std::raise(signal_number);
+}
+
+}  // namespace
+
+void remove_temporaries_on_signals() {
+    for (int s : {SIGINT, SIGTERM, SIGHUP}) std::signal(s, on_signal);
+}
 
 void fail(const std::string& what) { throw Failure("", what); }
 
@@ -155,6 +181,7 @@ Output::Output(const std::string& path) : buffer_(1 << 16) {
         temporary_.clear();
         fail_system(name_, "cannot create");
     }
+    remember_temporary(temporary_);
     // mkstemp makes the file private; give it the mode a plain creation would.
     const mode_t mask = ::umask(0);
     ::umask(mask);
@@ -164,6 +191,7 @@ Output::Output(const std::string& path) : buffer_(1 << 16) {
 Output::~Output() {
     if (fd_ > STDERR_FILENO) ::close(fd_);
     if (!committed_ && !temporary_.empty()) ::unlink(temporary_.c_str());
+    if (!temporary_.empty()) temporary_set = 0;
 }
 
 void Output::flush() {

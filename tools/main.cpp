@@ -3,6 +3,8 @@
 // carries nothing but JPEG data (or the help and version texts).
 #include "tool.h"
 
+#include <TekoJEncoder.h>
+
 #include <cmath>
 #include <cstdio>
 #include <cstring>
@@ -290,7 +292,12 @@ int main(int argc, char** argv) {
         return std::fflush(stdout) == 0 ? 0 : 1;
     }
     if (a.version) {
+#ifdef TEKOJ_VERSION_MAJOR
+        const uint32_t v = eko_GetVersion();
+        std::printf("tekoj (libTekoJEncoder) %u.%u.%u\n", v / 10000, v / 100 % 100, v % 100);
+#else
         std::printf("tekoj (libTekoJEncoder) %s\n", TEKOJ_TOOL_VERSION);
+#endif
         return std::fflush(stdout) == 0 ? 0 : 1;
     }
 
@@ -310,6 +317,7 @@ int main(int argc, char** argv) {
         }
     }
 
+    remove_temporaries_on_signals();
     Progress progress(jobs.size());
     int status = 0;
     for (size_t i = 0; i < jobs.size(); ++i) {

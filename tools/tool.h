@@ -53,6 +53,9 @@ private:
     bool at_end_ = false;
 };
 
+// Makes SIGINT, SIGTERM and SIGHUP remove the temporary of an Output first.
+void remove_temporaries_on_signals();
+
 // An output file that appears only once it is complete: a regular file is
 // written to a temporary beside it and renamed over it by commit(); anything
 // left uncommitted is removed. Standard output ("-") and existing special

@@ -193,11 +193,22 @@ std::string png(uint32_t format, const Rgb* q = kQuadrants) {
                 wide[(static_cast<size_t>(y) * W + x) * channels + k] = static_cast<uint16_t>(v * 257);
             }
         }
+    // A palette image: one index byte per pixel into the four colours.
+    uint8_t palette[12];
+    Bytes indices;
+    if (format & PNG_FORMAT_FLAG_COLORMAP) {
+        image.colormap_entries = 4;
+        for (int k = 0; k < 4; ++k)
+            palette[3 * k] = uint8_t(q[k].r), palette[3 * k + 1] = uint8_t(q[k].g), palette[3 * k + 2] = uint8_t(q[k].b);
+        for (int y = 0; y < H; ++y)
+            for (int x = 0; x < W; ++x) indices.push_back(static_cast<uint8_t>(&colour(q, x, y) - q));
+    }
     png_alloc_size_t bytes = 0;
-    const void* pixels = size == 2 ? static_cast<const void*>(wide.data()) : narrow.data();
-    png_image_write_to_memory(&image, nullptr, &bytes, 0, pixels, 0, nullptr);
+    const void* pixels = !indices.empty() ? indices.data() : size == 2 ? static_cast<const void*>(wide.data()) : narrow.data();
+    const void* map = indices.empty() ? nullptr : palette;
+    png_image_write_to_memory(&image, nullptr, &bytes, 0, pixels, 0, map);
     std::string out(bytes, '\0');
-    png_image_write_to_memory(&image, out.data(), &bytes, 0, pixels, 0, nullptr);
+    png_image_write_to_memory(&image, out.data(), &bytes, 0, pixels, 0, map);
     return out;
 }
 
@@ -211,6 +222,7 @@ protected:
         mkdir((g_dir + "/subdir").c_str(), 0755);
         write_file("rgb.png", png(PNG_FORMAT_RGB));
         write_file("rgba.png", png(PNG_FORMAT_RGBA));
+        write_file("palette.png", png(PNG_FORMAT_RGB_COLORMAP));
         write_file("grey16.png", png(PNG_FORMAT_LINEAR_Y));
         const std::string whole = png(PNG_FORMAT_RGB);
         write_file("truncated.png", whole.substr(0, whole.size() / 2));
@@ -257,6 +269,7 @@ TEST_F(Tool, EncodesEveryInputKind) {
         {{"rgba.png"}, TJSAMP_420, white_corner},
         {{"--background", "000000", "rgba.png"}, TJSAMP_420, black_corner},
         {{"grey16.png"}, TJSAMP_GRAY, kQuadrants},
+        {{"palette.png"}, TJSAMP_420, kQuadrants},
         {{"comments.ppm"}, TJSAMP_420, kQuadrants},
         {{"ascii.ppm"}, TJSAMP_420, kQuadrants},
         {{"wide.ppm"}, TJSAMP_420, kQuadrants},
