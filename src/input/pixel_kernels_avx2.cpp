@@ -7,6 +7,8 @@
 
 #include <immintrin.h>
 
+#include <cstddef>
+
 namespace tekoj {
 namespace {
 

@@ -11,6 +11,8 @@
 
 #include <arm_neon.h>
 
+#include <cstddef>
+
 namespace tekoj {
 namespace {
 

@@ -11,6 +11,7 @@
 
 #include <emmintrin.h>
 
+#include <cstddef>
 #include <cstring>
 
 namespace tekoj {
