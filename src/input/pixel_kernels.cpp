@@ -81,6 +81,26 @@ void luma422(const uint8_t* s, uint32_t groups, uint8_t* y) {
     }
 }
 
+void halve422(const uint8_t* s, uint32_t dw, uint32_t* start, uint32_t* finish) {
+    for (uint32_t i = 0; i < dw; ++i, s += 4) {
+        const uint32_t sum = (static_cast<uint32_t>(s[0]) + s[2]) << 20 | static_cast<uint32_t>(s[1]) << 11 |
+                             static_cast<uint32_t>(s[3]) << 1;
+        if (start != nullptr) start[i] = sum;
+        if (finish != nullptr) finish[i] += sum;
+    }
+}
+
+// Each field holds a sum of four samples below 1024: the byte is its top 8
+// bits. Chroma comes from the even column of each pair, not averaged.
+void yuv_row(const uint32_t* words, uint32_t count, uint8_t* y, uint8_t* u, uint8_t* v) {
+    for (uint32_t i = 0; i < count; ++i) y[i] = static_cast<uint8_t>(words[i] >> 22);
+    if (u == nullptr) return;
+    for (uint32_t k = 0; 2 * k < count; ++k) {
+        u[k] = static_cast<uint8_t>(words[2 * k] >> 12);
+        v[k] = static_cast<uint8_t>(words[2 * k] >> 2);
+    }
+}
+
 }  // namespace
 
 const InputKernels kPortableInputKernels = {
@@ -89,6 +109,8 @@ const InputKernels kPortableInputKernels = {
     rgb565_blocks,
     split422,
     luma422,
+    halve422,
+    yuv_row,
 };
 
 const InputKernels* input_kernels_for(SimdLevel level) {

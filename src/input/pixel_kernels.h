@@ -33,6 +33,15 @@ struct InputKernels {
     // and one Cb and one Cr each; the luma variant drops the chroma.
     void (*split422)(const uint8_t* src, uint32_t groups, uint8_t* y, uint8_t* cb, uint8_t* cr);
     void (*luma422)(const uint8_t* src, uint32_t groups, uint8_t* y);
+    // Down-scaler halving the width of a packed 4:2:2 row: output column i
+    // takes the source pixels of group i, whose two sample words add to
+    // (Y0 + Y1) << 20 | 2U << 10 | 2V. The sum is stored into start[i] and
+    // then added to finish[i], each only when not null; the two may be the
+    // same row, which then receives the sum twice.
+    void (*halve422)(const uint8_t* src, uint32_t dw, uint32_t* start, uint32_t* finish);
+    // Down-scaler row writer: Y of `count` sums of four sample words, and when
+    // u is not null U and V of the even ones ((count + 1) / 2 each).
+    void (*yuv_row)(const uint32_t* words, uint32_t count, uint8_t* y, uint8_t* u, uint8_t* v);
 };
 
 // The table of the process's SIMD level, chosen on first use.

@@ -162,6 +162,47 @@ void luma422(const uint8_t* s, uint32_t groups, uint8_t* y) {
     input_kernels_sse2()->luma422(s + 4 * k, groups - k, y + 2 * k);
 }
 
+// Halving down-scaler: the SSE2 arithmetic on eight groups per step.
+void halve422(const uint8_t* s, uint32_t dw, uint32_t* start, uint32_t* finish) {
+    const __m256i ones = _mm256_set1_epi16(1), uv_weights = _mm256_set1_epi32(pair(2048, 2));
+    uint32_t i = 0;
+    for (; i + 8 <= dw; i += 8) {
+        const __m256i g = _mm256_loadu_si256(reinterpret_cast<const __m256i*>(s + 4 * i));
+        const __m256i y = _mm256_madd_epi16(_mm256_and_si256(g, _mm256_set1_epi16(0x00FF)), ones);
+        const __m256i sum =
+            _mm256_add_epi32(_mm256_slli_epi32(y, 20), _mm256_madd_epi16(_mm256_srli_epi16(g, 8), uv_weights));
+        if (start != nullptr) _mm256_storeu_si256(reinterpret_cast<__m256i*>(start + i), sum);
+        if (finish != nullptr) {
+            __m256i* f = reinterpret_cast<__m256i*>(finish + i);
+            _mm256_storeu_si256(f, _mm256_add_epi32(_mm256_loadu_si256(f), sum));
+        }
+    }
+    input_kernels_sse2()->halve422(s + 4 * i, dw - i, start != nullptr ? start + i : nullptr,
+                                   finish != nullptr ? finish + i : nullptr);
+}
+
+// The low 8 bits of words shifted right (every bit pattern of the caller's
+// words gives the portable bytes).
+inline __m256i top8(__m256i w, int shift) {
+    return _mm256_and_si256(_mm256_srli_epi32(w, shift), _mm256_set1_epi32(0xFF));
+}
+
+// Down-scaler row writer: 32 words per step.
+void yuv_row(const uint32_t* words, uint32_t count, uint8_t* y, uint8_t* u, uint8_t* v) {
+    uint32_t i = 0;
+    for (; i + 32 <= count; i += 32) {
+        __m256i w[4];
+        for (int j = 0; j < 4; ++j) w[j] = _mm256_loadu_si256(reinterpret_cast<const __m256i*>(words + i + 8 * j));
+        _mm256_storeu_si256(reinterpret_cast<__m256i*>(y + i),
+                            pack32(top8(w[0], 22), top8(w[1], 22), top8(w[2], 22), top8(w[3], 22)));
+        if (u == nullptr) continue;
+        const __m256i e0 = evens(w[0], w[1]), e1 = evens(w[2], w[3]);
+        store_chroma(top8(e0, 12), top8(e1, 12), top8(e0, 2), top8(e1, 2), u + i / 2, v + i / 2);
+    }
+    input_kernels_sse2()->yuv_row(words + i, count - i, y + i, u != nullptr ? u + i / 2 : nullptr,
+                                  v != nullptr ? v + i / 2 : nullptr);
+}
+
 // RGB565 averages 2x2 blocks across two rows; the work is in the shifts and
 // pair sums, and the SSE2 kernel does it.
 void rgb565_blocks(const uint8_t* upper, const uint8_t* lower, uint32_t blocks, uint8_t* y0, uint8_t* y1, uint8_t* cb,
@@ -175,6 +216,8 @@ const InputKernels kAvx2 = {
     rgb565_blocks,
     split422,
     luma422,
+    halve422,
+    yuv_row,
 };
 
 }  // namespace

@@ -151,12 +151,62 @@ void luma422(const uint8_t* s, uint32_t groups, uint8_t* y) {
     kPortableInputKernels.luma422(s + 4 * k, groups - k, y + 2 * k);
 }
 
+// Halving down-scaler: sixteen groups per step; (Y0 + Y1) << 20 | U << 11 |
+// V << 1 assembled by widening shifts.
+inline uint32x4_t halve4(uint16x4_t y, uint16x4_t u, uint16x4_t v) {
+    return vorrq_u32(vorrq_u32(vshlq_n_u32(vshll_n_u16(y, 16), 4), vshll_n_u16(u, 11)), vshll_n_u16(v, 1));
+}
+
+inline void halve_store(uint32x4_t sum, uint32_t* start, uint32_t* finish, uint32_t i) {
+    if (start != nullptr) vst1q_u32(start + i, sum);
+    if (finish != nullptr) vst1q_u32(finish + i, vaddq_u32(vld1q_u32(finish + i), sum));
+}
+
+void halve422(const uint8_t* s, uint32_t dw, uint32_t* start, uint32_t* finish) {
+    uint32_t i = 0;
+    for (; i + 16 <= dw; i += 16) {
+        const uint8x16x4_t g = vld4q_u8(s + 4 * i);
+        const uint16x8_t ylo = vaddl_u8(vget_low_u8(g.val[0]), vget_low_u8(g.val[2]));
+        const uint16x8_t yhi = vaddl_u8(vget_high_u8(g.val[0]), vget_high_u8(g.val[2]));
+        const uint16x8_t ulo = vmovl_u8(vget_low_u8(g.val[1])), uhi = vmovl_u8(vget_high_u8(g.val[1]));
+        const uint16x8_t vlo = vmovl_u8(vget_low_u8(g.val[3])), vhi = vmovl_u8(vget_high_u8(g.val[3]));
+        halve_store(halve4(vget_low_u16(ylo), vget_low_u16(ulo), vget_low_u16(vlo)), start, finish, i);
+        halve_store(halve4(vget_high_u16(ylo), vget_high_u16(ulo), vget_high_u16(vlo)), start, finish, i + 4);
+        halve_store(halve4(vget_low_u16(yhi), vget_low_u16(uhi), vget_low_u16(vhi)), start, finish, i + 8);
+        halve_store(halve4(vget_high_u16(yhi), vget_high_u16(uhi), vget_high_u16(vhi)), start, finish, i + 12);
+    }
+    kPortableInputKernels.halve422(s + 4 * i, dw - i, start != nullptr ? start + i : nullptr,
+                                   finish != nullptr ? finish + i : nullptr);
+}
+
+// Down-scaler row writer: sixteen words per step, even and odd apart.
+// Narrowing keeps the low bits, so no mask is needed after the shift.
+template <int Shift>
+inline uint8x8_t top8(uint32x4_t a, uint32x4_t b) {
+    return vmovn_u16(vcombine_u16(vmovn_u32(vshrq_n_u32(a, Shift)), vmovn_u32(vshrq_n_u32(b, Shift))));
+}
+
+void yuv_row(const uint32_t* words, uint32_t count, uint8_t* y, uint8_t* u, uint8_t* v) {
+    uint32_t i = 0;
+    for (; i + 16 <= count; i += 16) {
+        const uint32x4x2_t a = vld2q_u32(words + i), b = vld2q_u32(words + i + 8);  // even, odd
+        vst2_u8(y + i, (uint8x8x2_t{{top8<22>(a.val[0], b.val[0]), top8<22>(a.val[1], b.val[1])}}));
+        if (u == nullptr) continue;
+        vst1_u8(u + i / 2, top8<12>(a.val[0], b.val[0]));
+        vst1_u8(v + i / 2, top8<2>(a.val[0], b.val[0]));
+    }
+    kPortableInputKernels.yuv_row(words + i, count - i, y + i, u != nullptr ? u + i / 2 : nullptr,
+                                  v != nullptr ? v + i / 2 : nullptr);
+}
+
 const InputKernels kNeon = {
     {pick_upper<3, false, kRgb888>, pick_upper<4, false, kRgba8888>, pick_upper<4, true, kBgra8888>},
     {pick_lower<3, false, kRgb888>, pick_lower<4, false, kRgba8888>, pick_lower<4, true, kBgra8888>},
     rgb565_blocks,
     split422,
     luma422,
+    halve422,
+    yuv_row,
 };
 
 }  // namespace

@@ -213,12 +213,56 @@ void luma422(const uint8_t* s, uint32_t groups, uint8_t* y) {
     kPortableInputKernels.luma422(s + 4 * k, groups - k, y + 2 * k);
 }
 
+// Halving down-scaler: four groups per 16 bytes. The words (Y0, Y1) of each
+// group add by pmaddwd with (1, 1); (U, V) weighted (2048, 2) give 2U << 10
+// plus 2V.
+void halve422(const uint8_t* s, uint32_t dw, uint32_t* start, uint32_t* finish) {
+    const __m128i ones = _mm_set1_epi16(1), uv_weights = _mm_set1_epi32(pair(2048, 2));
+    uint32_t i = 0;
+    for (; i + 4 <= dw; i += 4) {
+        const __m128i g = _mm_loadu_si128(reinterpret_cast<const __m128i*>(s + 4 * i));
+        const __m128i y = _mm_madd_epi16(_mm_and_si128(g, _mm_set1_epi16(0x00FF)), ones);
+        const __m128i sum = _mm_add_epi32(_mm_slli_epi32(y, 20), _mm_madd_epi16(_mm_srli_epi16(g, 8), uv_weights));
+        if (start != nullptr) _mm_storeu_si128(reinterpret_cast<__m128i*>(start + i), sum);
+        if (finish != nullptr) {
+            __m128i* f = reinterpret_cast<__m128i*>(finish + i);
+            _mm_storeu_si128(f, _mm_add_epi32(_mm_loadu_si128(f), sum));
+        }
+    }
+    kPortableInputKernels.halve422(s + 4 * i, dw - i, start != nullptr ? start + i : nullptr,
+                                   finish != nullptr ? finish + i : nullptr);
+}
+
+// The low 8 bits of words shifted right: the top 8 of a 10-bit field.
+inline __m128i top8(__m128i w, int shift) { return _mm_and_si128(_mm_srli_epi32(w, shift), _mm_set1_epi32(0xFF)); }
+
+// Down-scaler row writer. The words come from the caller too, so every bit
+// pattern must give the portable bytes: each value is masked, not saturated.
+void yuv_row(const uint32_t* words, uint32_t count, uint8_t* y, uint8_t* u, uint8_t* v) {
+    uint32_t i = 0;
+    for (; i + 16 <= count; i += 16) {
+        __m128i w[4];
+        for (int j = 0; j < 4; ++j) w[j] = _mm_loadu_si128(reinterpret_cast<const __m128i*>(words + i + 4 * j));
+        _mm_storeu_si128(reinterpret_cast<__m128i*>(y + i),
+                         pack16(top8(w[0], 22), top8(w[1], 22), top8(w[2], 22), top8(w[3], 22)));
+        if (u == nullptr) continue;
+        const __m128i e0 = evens(w[0], w[1]), e1 = evens(w[2], w[3]);
+        const __m128i uv = pack16(top8(e0, 12), top8(e1, 12), top8(e0, 2), top8(e1, 2));
+        _mm_storel_epi64(reinterpret_cast<__m128i*>(u + i / 2), uv);
+        _mm_storel_epi64(reinterpret_cast<__m128i*>(v + i / 2), _mm_srli_si128(uv, 8));
+    }
+    kPortableInputKernels.yuv_row(words + i, count - i, y + i, u != nullptr ? u + i / 2 : nullptr,
+                                  v != nullptr ? v + i / 2 : nullptr);
+}
+
 const InputKernels kSse2 = {
     {pick_upper<3, false, kRgb888>, pick_upper<4, false, kRgba8888>, pick_upper<4, true, kBgra8888>},
     {pick_lower<3, false, kRgb888>, pick_lower<4, false, kRgba8888>, pick_lower<4, true, kBgra8888>},
     rgb565_blocks,
     split422,
     luma422,
+    halve422,
+    yuv_row,
 };
 
 }  // namespace

@@ -1,5 +1,5 @@
-// Every SIMD level's input row kernels against the portable ones, byte for
-// byte: random rows (extremes included) of every width from 1 to 48 and a
+// Every SIMD level's input row kernels (RGB readers, packed 4:2:2 readers,
+// down-scaler) against the portable ones, byte for byte: random rows (extremes included) of every width from 1 to 48 and a
 // few large odd ones, and rows of real photographs. Each kernel is called
 // directly through each level's table, whatever level the process runs, so
 // one run (and the sanitizer build) covers every level the processor has.
@@ -12,6 +12,7 @@
 #include <gtest/gtest.h>
 
 #include <algorithm>
+#include <cstring>
 #include <functional>
 #include <string>
 #include <vector>
@@ -75,6 +76,27 @@ std::vector<KernelCase> kernel_cases() {
                          const uint32_t groups = w / 2;
                          const Bytes row(src.begin(), src.begin() + 4 * groups);
                          return outputs({2 * groups}, [&](std::vector<Bytes>& o) { k.luma422(row.data(), groups, o[0].data()); });
+                     }});
+    // Down-scaler: halving `w` groups into accumulator rows (start only,
+    // finish only, both apart, both the same row), and the row writer with and
+    // without chroma, on the source read as 32-bit words.
+    cases.push_back({"halve 4:2:2", 4, [](const InputKernels& k, const Bytes& src, uint32_t w) {
+                         std::vector<uint32_t> a(w), b(w);
+                         for (uint32_t i = 0; i < w; ++i) a[i] = b[i] = 0x01002003u * i;
+                         k.halve422(src.data(), w, a.data(), nullptr);
+                         k.halve422(src.data(), w, nullptr, b.data());
+                         k.halve422(src.data(), w, a.data(), b.data());
+                         k.halve422(src.data(), w, b.data(), b.data());
+                         a.insert(a.end(), b.begin(), b.end());
+                         return Bytes(reinterpret_cast<const uint8_t*>(a.data()), reinterpret_cast<const uint8_t*>(a.data() + a.size()));
+                     }});
+    cases.push_back({"down-scale rows", 4, [](const InputKernels& k, const Bytes& src, uint32_t w) {
+                         std::vector<uint32_t> words(w);
+                         std::memcpy(words.data(), src.data(), 4 * static_cast<size_t>(w));
+                         return outputs({w, w, (w + 1) / 2, (w + 1) / 2}, [&](std::vector<Bytes>& o) {
+                             k.yuv_row(words.data(), w, o[0].data(), nullptr, nullptr);
+                             k.yuv_row(words.data(), w, o[1].data(), o[2].data(), o[3].data());
+                         });
                      }});
     return cases;
 }
