@@ -438,16 +438,6 @@ EKO_API uint32_t eko_enc_jpeg_parallel_rows(EkoParallelEncode* encode, uint32_t 
 EKO_API uint32_t eko_enc_jpeg_parallel_finish(EkoParallelEncode* encode, uint8_t** buffer_out,
                                               uint32_t* length_out);
 
-/* Row entropy drivers and column-split mode. */
-EKO_API uint32_t __eko_jpeg_enc_entroy_encoder(EncoderContext* context, McuBlockList* mcus,
-                                               uint32_t* next_row_out);
-EKO_API uint32_t __OvidanJpegEncEntroyEncoder(EncoderContext* context, McuBlockList* mcus,
-                                              uint32_t* next_row_out);
-EKO_API uint32_t __eko_jpeg_enc_col_encoder_init(EncoderContext* context);
-EKO_API uint32_t __eko_jpeg_enc_col_entroy_encoder(EncoderContext* context, McuBlockList* mcus,
-                                                   uint32_t* next_col_out);
-EKO_API uint32_t __eko_jpeg_enc_col_encoder_finish(EncoderContext* context);
-
 /* ------------------------------------------------------------------------ */
 /* Tables and conversions for display                                        */
 /* ------------------------------------------------------------------------ */
