@@ -3,7 +3,7 @@
 // decodes the stream without an error or a warning, at the size asked for.
 #pragma once
 
-#include <TekoJEncoder.h>
+#include <TekoJEncoderInternal.h>
 
 #include <turbojpeg.h>
 

@@ -170,7 +170,8 @@ def main():
     copy_tree(tree)
     if not os.path.exists(os.path.join(build, "build.ninja")):
         r = run(["cmake", "-S", tree, "-B", build, "-G", "Ninja", "-DCMAKE_BUILD_TYPE=Release",
-                 "-DTEKOJ_BUILD_BENCH=OFF", "-DTEKOJ_BUILD_TOOLS=OFF"], ROOT)
+                 "-DTEKOJ_BUILD_TESTS=ON", "-DTEKOJ_WERROR=ON", "-DTEKOJ_BUILD_BENCH=OFF", "-DTEKOJ_BUILD_TOOLS=OFF"],
+                ROOT)
         if r.returncode != 0:
             sys.stdout.write(r.stdout.decode())
             return 1
