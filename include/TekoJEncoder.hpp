@@ -4,8 +4,14 @@
 
 #include <TekoJEncoder.h>
 
+#include <algorithm>
+#include <atomic>
+#include <condition_variable>
 #include <cstdint>
+#include <functional>
+#include <mutex>
 #include <string_view>
+#include <thread>
 #include <utility>
 #include <vector>
 
@@ -73,7 +79,7 @@ inline uint32_t append(void* arg, const uint8_t* data, uint32_t count) {
 }
 inline uint32_t failure_code() {
     const uint32_t code = eko_GetLastError();
-    return code == EKO_OK ? EKO_ERR_ARGUMENT : code;
+    return code == EKO_OK ? uint32_t{EKO_ERR_ARGUMENT} : code;
 }
 }  // namespace detail
 
@@ -94,7 +100,7 @@ inline Encoded encode(const Image& image, uint32_t quality) {
 inline uint32_t encode_to_file(const Image& image, const char* path, uint32_t quality) {
     const ImageInfo info = image.info();
     eko_SetError(EKO_OK);
-    return eko_enc_jpeg_to_file(&info, path, quality) == 1 ? EKO_OK : detail::failure_code();
+    return eko_enc_jpeg_to_file(&info, path, quality) == 1 ? uint32_t{EKO_OK} : detail::failure_code();
 }
 
 // Incremental encoder: one band (MCU row) per call, into memory. The stream
@@ -150,5 +156,89 @@ private:
     EncoderContext* context_ = nullptr;
     uint32_t error_ = EKO_OK;
 };
+
+// Runs each job it is given on some thread, in any order, and may return
+// before they finish (a thread pool's submit). The parallel encoders below
+// wait for their jobs themselves.
+using Executor = std::function<void(std::function<void()> job)>;
+
+namespace detail {
+// Codes every MCU row of `encode`: the calling thread and up to `threads` - 1
+// more (std::threads, or jobs handed to `executor`) take rows in order from a
+// shared counter. The C library starts no thread of its own.
+inline void run_rows(EkoParallelEncode* encode, uint32_t threads, const Executor& executor) {
+    const uint32_t rows = eko_enc_jpeg_parallel_row_count(encode);
+    std::atomic<uint32_t> next{0};
+    auto work = [encode, rows, &next](uint32_t worker) {
+        for (uint32_t row; (row = next.fetch_add(1)) < rows;)
+            if (eko_enc_jpeg_parallel_rows(encode, worker, row, 1) != 1) break;
+    };
+    const uint32_t helpers = std::min(threads, rows) - 1;
+    if (!executor) {
+        std::vector<std::thread> pool;
+        for (uint32_t w = 1; w <= helpers; ++w) pool.emplace_back(work, w);
+        work(0);
+        for (auto& t : pool) t.join();
+        return;
+    }
+    std::mutex lock;
+    std::condition_variable finished;
+    uint32_t running = helpers;
+    for (uint32_t w = 1; w <= helpers; ++w)
+        executor([&, w] {
+            work(w);
+            std::lock_guard<std::mutex> g(lock);
+            if (--running == 0) finished.notify_one();
+        });
+    work(0);
+    std::unique_lock<std::mutex> g(lock);
+    finished.wait(g, [&] { return running == 0; });
+}
+
+inline uint32_t worker_count(unsigned threads) {
+    const unsigned cores = threads != 0 ? threads : std::max(1u, std::thread::hardware_concurrency());
+    return std::min(cores, 64u);
+}
+}  // namespace detail
+
+// Encodes a whole image with several threads (0: one per core, at most one
+// per MCU row), into memory owned by the result. The bytes are those of the
+// single-threaded encode.
+inline Encoded encode(const Image& image, uint32_t quality, unsigned threads, const Executor& executor = {}) {
+    Encoded result;
+    const ImageInfo info = image.info();
+    const EncodeOptions options{quality, nullptr, 0};
+    const OutputRequest request{EKO_OUTPUT_STREAM, nullptr, nullptr, 0};
+    const uint32_t workers = detail::worker_count(threads);
+    eko_SetError(EKO_OK);
+    EkoParallelEncode* encode =
+        eko_enc_jpeg_parallel_create(&info, &request, &options, nullptr, &detail::append, &result.bytes, workers);
+    if (encode != nullptr) detail::run_rows(encode, workers, executor);
+    if (encode == nullptr || eko_enc_jpeg_parallel_finish(encode, nullptr, nullptr) != 1) {
+        result.bytes.clear();
+        result.error = detail::failure_code();
+    }
+    return result;
+}
+
+// The same into a file; returns EKO_OK or the error code.
+inline uint32_t encode_to_file(const Image& image, const char* path, uint32_t quality, unsigned threads,
+                               const Executor& executor = {}) {
+    const ImageInfo info = image.info();
+    const EncodeOptions options{quality, nullptr, 0};
+    eko_SetError(EKO_OK);
+    void* file = path != nullptr ? DORVATEKO_OsFopen(path, "wb") : nullptr;
+    if (file == nullptr) return path != nullptr ? uint32_t{EKO_ERR_OPEN} : uint32_t{EKO_ERR_ARGUMENT};
+    const OutputRequest request{EKO_OUTPUT_FILE, file, nullptr, 0};
+    const uint32_t workers = detail::worker_count(threads);
+    EkoParallelEncode* encode =
+        eko_enc_jpeg_parallel_create(&info, &request, &options, nullptr, nullptr, nullptr, workers);
+    if (encode != nullptr) detail::run_rows(encode, workers, executor);
+    uint32_t code = encode != nullptr && eko_enc_jpeg_parallel_finish(encode, nullptr, nullptr) == 1
+                        ? uint32_t{EKO_OK}
+                        : detail::failure_code();
+    if (DORVATEKO_OsFclose(file) != 0 && code == EKO_OK) code = EKO_ERR_WRITE;
+    return code;
+}
 
 }  // namespace tekoj

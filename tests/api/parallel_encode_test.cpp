@@ -1,7 +1,7 @@
 // Row-parallel encoding: for every format, size, thread count and output
 // kind the stream equals the single-threaded one; the callback gets it in
 // order, one call at a time; failures anywhere leak nothing.
-#include <TekoJEncoder.h>
+#include <TekoJEncoder.hpp>
 
 #include "incremental/incremental_support.h"
 #include "support/fault_os_layer.h"
@@ -187,4 +187,21 @@ TEST(Parallel, MisuseIsRefusedAndFailuresLeakNothing) {
     EXPECT_TRUE(parallel(noisy, EKO_OUTPUT_FILE, 3, 95).empty());
     fail_writes_after(-1);
     EXPECT_EQ(live_blocks(), live);
+}
+
+TEST(Parallel, CppLayerWithThreadsOrAnExecutor) {
+    const Bytes rgb = photo_rgb(90, 70, 6);
+    const tekoj::Image image{rgb.data(), 90, 70, tekoj::Format::rgb888};
+    const Bytes reference = tekoj::encode(image, 80).bytes;
+    EXPECT_EQ(tekoj::encode(image, 80, 3).bytes, reference);
+    EXPECT_EQ(tekoj::encode(image, 80, 0).bytes, reference);
+    std::vector<std::thread> pool;
+    EXPECT_EQ(tekoj::encode(image, 80, 4, [&](std::function<void()> job) { pool.emplace_back(std::move(job)); })
+                  .bytes,
+              reference);
+    for (auto& t : pool) t.join();
+    ASSERT_EQ(tekoj::encode_to_file(image, kPath.c_str(), 80, 2), uint32_t(EKO_OK));
+    EXPECT_EQ(read_file(kPath), reference);
+    const tekoj::Image refused{rgb.data(), 90, 70, tekoj::Format(3)};
+    EXPECT_EQ(tekoj::encode(refused, 80, 2).error, uint32_t(EKO_ERR_FORMAT));
 }
