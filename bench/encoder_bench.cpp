@@ -8,7 +8,7 @@
 //   tekoj_bench --rows [image]                per-row times, simulated scaling
 //
 // Set JSIMD_FORCENONE=1 to compare against libjpeg-turbo without its SIMD.
-#include <TekoJEncoder.h>
+#include <TekoJEncoderInternal.h>
 #include <turbojpeg.h>
 
 #include <algorithm>

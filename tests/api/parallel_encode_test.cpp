@@ -191,17 +191,19 @@ TEST(Parallel, MisuseIsRefusedAndFailuresLeakNothing) {
 
 TEST(Parallel, CppLayerWithThreadsOrAnExecutor) {
     const Bytes rgb = photo_rgb(90, 70, 6);
-    const tekoj::Image image{rgb.data(), 90, 70, tekoj::Format::rgb888};
-    const Bytes reference = tekoj::encode(image, 80).bytes;
-    EXPECT_EQ(tekoj::encode(image, 80, 3).bytes, reference);
-    EXPECT_EQ(tekoj::encode(image, 80, 0).bytes, reference);
+    const tekoj::ImageView view(rgb.data(), 90, 70, tekoj::PixelFormat::rgb888);
+    tekoj::Encoder encoder;
+    encoder.quality(80);
+    const Bytes reference = encoder.encode(view);
+    EXPECT_EQ(reference, encode_to_memory(image_info(rgb.data(), 90, 70, EKO_FORMAT_RGB888), 80));
+    EXPECT_EQ(encoder.threads(3).encode(view), reference);
+    EXPECT_EQ(encoder.threads(0).encode(view), reference);
     std::vector<std::thread> pool;
-    EXPECT_EQ(tekoj::encode(image, 80, 4, [&](std::function<void()> job) { pool.emplace_back(std::move(job)); })
-                  .bytes,
-              reference);
+    encoder.threads(4, [&](std::function<void()> job) { pool.emplace_back(std::move(job)); });
+    EXPECT_EQ(encoder.encode(view), reference);
     for (auto& t : pool) t.join();
-    ASSERT_EQ(tekoj::encode_to_file(image, kPath.c_str(), 80, 2), uint32_t(EKO_OK));
+    encoder.threads(2).encode_to_file(view, kPath);
     EXPECT_EQ(read_file(kPath), reference);
-    const tekoj::Image refused{rgb.data(), 90, 70, tekoj::Format(3)};
-    EXPECT_EQ(tekoj::encode(refused, 80, 2).error, uint32_t(EKO_ERR_FORMAT));
+    // A sink that stops the stream fails the parallel encode too.
+    EXPECT_EQ(encoder.try_encode_to(view, [](const uint8_t*, size_t) { return false; }), uint32_t(EKO_ERR_WRITE));
 }
