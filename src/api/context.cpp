@@ -239,6 +239,7 @@ EKO_API uint32_t __eko_jpeg_enc_initail_setup(EncoderContext* context) {
     if (__eko_jpeg_enc_prepare_huffman_code(ctx) != 1) return 0;
     if (__eko_jpeg_enc_setup_scan(ctx) != 1) return 0;
     __eko_jpeg_enc_setup_imcu(ctx);
+    if (!tekoj::build_coder_tables(ctx)) return 0;
 
     ctx->output = static_cast<OutputTarget*>(DORVATEKO_OsMalloc(sizeof(OutputTarget)));
     if (ctx->output == nullptr) {
@@ -281,6 +282,7 @@ EKO_API void __eko_jpeg_enc_release_mem(EncoderContext* context) {
         release(ctx->entropy->ac_codes[1]);
         release(ctx->entropy);
     }
+    release(ctx->coder_tables);
     release(ctx->comp_info);
     release(ctx->natural_order);
     release(ctx->output);

@@ -1,13 +1,14 @@
 // Stream completion: pad the last byte with 1-bits, append EOI (unless more
 // bands follow), hand the rest on or fix the memory stream's length.
 #include "api/output_target.h"
+#include "core/entropy_coder.h"
 
 namespace tekoj {
 namespace {
 
 bool complete(EncoderContext* ctx, bool with_eoi) {
     if (!make_room(ctx, 10, 10)) return false;
-    __eko_jpeg_enc_finish_compression(ctx);
+    pad_final_byte(ctx);
     OutputTarget* t = ctx->output;
     if (with_eoi) put_u16(t, 0xFFD9);
     bool ok = true;
@@ -29,12 +30,7 @@ bool complete(EncoderContext* ctx, bool with_eoi) {
 extern "C" {
 
 EKO_API uint32_t __eko_jpeg_enc_finish_compression(EncoderContext* context) {
-    EntropyState* es = context->entropy;
-    WorkingState ws{es->put_buffer, es->put_bits, {es->last_dc_val[0], es->last_dc_val[1], es->last_dc_val[2]},
-                    context};
-    __eko_jpeg_enc_write_bits(&ws, 0x7F, 7);
-    es->put_buffer = ws.put_buffer;
-    es->put_bits = ws.put_bits;
+    tekoj::pad_final_byte(context);
     return 1;
 }
 

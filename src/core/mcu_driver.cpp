@@ -25,6 +25,10 @@ bool compress_band(EncoderContext* ctx, uint8_t** const* row_arrays) {
     const uint32_t last_col = ctx->mcus_per_row - 1;
     const uint32_t last_band = ctx->total_imcu_rows - 1;
     int16_t* const* mcu = st->mcu_buffer;
+    // One coder for the whole band: the accumulator carries over from MCU to
+    // MCU and is written out a whole word at a time.
+    RowCoder coder;
+    begin_coding(coder, ctx);
     for (uint32_t y = st->mcu_vert_offset; y < st->mcu_rows_per_imcu_row; ++y) {
         for (uint32_t x = st->mcu_ctr; x <= last_col; ++x) {
             uint32_t blkn = 0;
@@ -49,10 +53,11 @@ bool compress_band(EncoderContext* ctx, uint8_t** const* row_arrays) {
                     start_row += 8;
                 }
             }
-            if (!encode_mcu(ctx, mcu)) return false;
+            if (!code_mcu(coder, ctx, mcu)) return false;
         }
         st->mcu_ctr = 0;
     }
+    end_coding(coder, ctx);
     ++st->imcu_row;
     __eko_jpeg_enc_setup_imcu(ctx);
     return true;

@@ -159,7 +159,7 @@ int64_t flush_rows(EncoderContext* ctx) {
         load_state(es, row);
         // The pad byte and its stuffed zero.
         if (!ensure_room(ctx, 2)) return -1;
-        __eko_jpeg_enc_finish_compression(ctx);
+        pad_final_byte(ctx);
         save_state(es, row);
         total += row->row_target->used;
     }
