@@ -1,0 +1,69 @@
+#!/bin/sh
+# ARM instructions per pixel of one encode, ours against libjpeg-turbo with its
+# NEON forced on, counted under qemu-arm (../shared/tools/arm-icount): each
+# case runs with 1 and 3 repetitions and half the difference is one encode.
+#
+#   scripts/arm-icount-bench.sh [quick]     quick: RGB888, YUV 4:2:0, grey only
+# Environment: TEKOJ_SIMD forces our level (portable, neon); BUILD_DIR.
+# Skips (status 0) where the cross tool chain, qemu-arm or armhf TurboJPEG is absent.
+set -eu
+cd "$(dirname "$0")/.."
+ROOT=$(pwd)
+ICOUNT=${ARM_ICOUNT:-$ROOT/../shared/tools/arm-icount/arm-icount}
+[ -x "$ICOUNT" ] || ICOUNT=/work/shared/tools/arm-icount/arm-icount
+IMAGE=${IMAGE:-$ROOT/../shared/images/elephants-3840x2160.jpg}
+[ -f "$IMAGE" ] || IMAGE=/work/shared/images/elephants-3840x2160.jpg
+BUILD_DIR=${BUILD_DIR:-build-armhf-bench}
+W=1920 H=1088
+skip() { echo "arm-icount-bench: skipped: $1"; exit 0; }
+command -v arm-linux-gnueabihf-g++ >/dev/null 2>&1 || skip "no arm-linux-gnueabihf-g++"
+command -v qemu-arm >/dev/null 2>&1 || skip "no qemu-arm"
+[ -x "$ICOUNT" ] || skip "no arm-icount tool"
+[ -f /usr/lib/arm-linux-gnueabihf/pkgconfig/libturbojpeg.pc ] || skip "no armhf libturbojpeg (libturbojpeg0-dev:armhf)"
+[ -f "$IMAGE" ] || skip "no image $IMAGE"
+
+cmake -S . -B "$BUILD_DIR" -G Ninja -DCMAKE_BUILD_TYPE=Release -DCMAKE_TOOLCHAIN_FILE=cmake/toolchains/armhf.cmake \
+  -DTEKOJ_BUILD_TESTS=OFF -DTEKOJ_BUILD_TOOLS=OFF >/dev/null 2>&1 || skip "armhf configure failed"
+cmake --build "$BUILD_DIR" -j 2 --target arm_icount_bench >/dev/null
+BIN=$BUILD_DIR/bench/arm_icount_bench
+RAW=$BUILD_DIR/frame-${W}x${H}.rgb
+[ -f "$RAW" ] || "$ICOUNT" "$BIN" prepare "$IMAGE" "$RAW" $W $H >/dev/null
+
+count() {  # who env format q reps -> instruction count
+  ARM_ICOUNT_ENV="$2" "$ICOUNT" "$BIN" "$1" "$3" "$4" "$5" "$RAW" $W $H 2>&1 | awk '/^icount/ {print $2}'
+}
+per_pixel() {  # who env format q -> instructions per pixel of one encode
+  one=$(count "$1" "$2" "$3" "$4" 1)
+  three=$(count "$1" "$2" "$3" "$4" 3)
+  awk -v a="$one" -v b="$three" -v n=$((W * H)) 'BEGIN { printf "%.1f", (b - a) / 2 / n }'
+}
+
+OURS_ENV=""
+[ -n "${TEKOJ_SIMD:-}" ] && OURS_ENV="TEKOJ_SIMD=$TEKOJ_SIMD"
+echo "ARM instructions per pixel, ${W}x${H} top-left crop of $(basename "$IMAGE"), 4:2:0, fast DCT, to memory"
+echo "ours: TEKOJ_SIMD=${TEKOJ_SIMD:-auto}; libjpeg-turbo: JSIMD_FORCENEON=1"
+printf '%-11s %3s %8s %8s %7s\n' input q ours turbo ratio
+for fmt in rgb888 yuv420 grey; do
+  for q in 75 90; do
+    o=$(per_pixel ours "$OURS_ENV" $fmt $q)
+    t=$(per_pixel turbo "JSIMD_FORCENEON=1" $fmt $q)
+    printf '%-11s %3s %8s %8s %7s\n' $fmt $q "$o" "$t" "$(awk -v a="$o" -v b="$t" 'BEGIN { printf "%.2f", a / b }')"
+  done
+done
+[ "${1:-}" = quick ] && exit 0
+for fmt in rgba8888 bgra8888; do
+  for q in 75 90; do
+    o=$(per_pixel ours "$OURS_ENV" $fmt $q)
+    t=$(per_pixel turbo "JSIMD_FORCENEON=1" $fmt $q)
+    printf '%-11s %3s %8s %8s %7s\n' $fmt $q "$o" "$t" "$(awk -v a="$o" -v b="$t" 'BEGIN { printf "%.2f", a / b }')"
+  done
+done
+for fmt in rgb565 nv21 packed422 packed422k; do
+  for q in 75 90; do
+    printf '%-11s %3s %8s %8s %7s\n' $fmt $q "$(per_pixel ours "$OURS_ENV" $fmt $q)" - -
+  done
+done
+echo "conversions (per source pixel):"
+for fmt in downscale rgb565conv pyv565conv; do
+  printf '%-11s %3s %8s %8s %7s\n' $fmt - "$(per_pixel ours "$OURS_ENV" $fmt 75)" - -
+done
