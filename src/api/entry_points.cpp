@@ -2,15 +2,20 @@
 // codes the image band by band, completes the stream and releases
 // everything. The buffer member also codes single bands of a larger image.
 #include "api/context.h"
-#include "api/output_target.h"
+#include "sink/output_target.h"
 #include "core/band_driver.h"
+#include "core/header_writer.h"
+#include "input/formats.h"
 
 namespace tekoj {
 namespace {
 
 constexpr uint32_t kMinMemoryBlock = 2048;
 
-uint32_t band_height(const ImageInfo* info) { return (info->format & 0xFF) == EKO_FORMAT_GREY ? 8 : 16; }
+uint32_t band_height(const ImageInfo* info) {
+    const FormatTraits* format = format_traits(info->format & 0xFF);
+    return format != nullptr ? format->band_height : 16;
+}
 
 // Band words that cannot describe a valid piece of one stream.
 bool band_words_valid(const ImageInfo* info) {
@@ -32,7 +37,7 @@ struct Result {
 
 Result run(const ImageInfo* info, const OutputRequest& request, const EncodeOptions* options,
            EkoStreamCallback callback, void* callback_arg, bool allow_bands) {
-    EncoderContext* ctx = __eko_jpeg_enc_initiaize(info, &request, options, nullptr);
+    EncoderContext* ctx = tekoj::create_context(info, &request, options, nullptr);
     if (ctx == nullptr) return {Outcome::CreationFailed, nullptr, 0};
     if (request.kind == EKO_OUTPUT_STREAM) {
         ctx->output->callback = callback;
@@ -43,7 +48,7 @@ Result run(const ImageInfo* info, const OutputRequest& request, const EncodeOpti
     if (!later_band) {
         ctx->exif_info = info->exif_info;
         if (band_mode) ctx->height = info->total_height;
-        __eko_jpeg_enc_make_header(ctx);
+        tekoj::write_header(ctx);
         ctx->height = info->height;
     } else {
         // Continue the whole stream's restart numbering: the band starts with
@@ -62,9 +67,9 @@ Result run(const ImageInfo* info, const OutputRequest& request, const EncodeOpti
     }
     if (ctx->failed == 0) {
         if (band_mode && info->band_open_end != 0)
-            __eko_jpeg_enc_make_without_end_mark(ctx);
+            tekoj::complete_stream(ctx, false);
         else
-            __eko_jpeg_enc_make_end_mark(ctx);
+            tekoj::complete_stream(ctx, true);
     }
 
     Result r{ctx->failed == 0 ? Outcome::Done : Outcome::Failed, nullptr, 0};

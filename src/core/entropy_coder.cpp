@@ -3,9 +3,9 @@
 // tables, and the exported coding steps as adapters.
 #include "core/entropy_coder.h"
 
-#include "api/output_target.h"
 #include "core/entropy_kernel.h"
 #include "core/simd_level.h"
+#include "sink/output_target.h"
 
 namespace tekoj {
 namespace {
@@ -14,37 +14,35 @@ namespace {
 // of a full accumulator, each possibly stuffed.
 constexpr uint32_t kPendingBytes = 2 * sizeof(BitAcc);
 
-OutputTarget* target_of(EncoderContext* ctx) { return ctx->output; }
-
 // Writes the whole waiting bytes and brings the target's fill count up to
 // the cursor, so that the target is exactly as a byte-wise writer leaves it.
-void sync(RowCoder& rc, OutputTarget* t) {
+void sync(RowCoder& rc) {
     flush_whole_bytes(rc.bits);
-    t->used = static_cast<uint32_t>(rc.bits.out - t->buffer);
+    rc.sink.target->used = static_cast<uint32_t>(rc.bits.out - rc.sink.target->buffer);
 }
 
 // The make-room point before each MCU. Decided from the cursor while that is
 // clearly far from the threshold; near it, from the exact fill count.
-bool room_for_mcu(RowCoder& rc, EncoderContext* ctx) {
-    OutputTarget* t = target_of(ctx);
-    const uint32_t margin = 128u * ctx->blocks_in_mcu;
+bool room_for_mcu(RowCoder& rc, uint32_t margin) {
+    OutputTarget* t = rc.sink.target;
     const uint64_t upper = static_cast<uint64_t>(rc.bits.out - t->buffer) + kPendingBytes;
-    if (upper + margin < t->capacity && ctx->failed == 0) return true;
-    sync(rc, t);
-    const bool ok = make_room(ctx, margin, 4096);
+    if (upper + margin < t->capacity && *rc.sink.failed == 0) return true;
+    sync(rc);
+    const bool ok = make_room(rc.sink, margin, 4096);
     rc.bits.out = t->buffer + t->used;
     return ok;
 }
 
 // Makes at least a worst-case block free at the cursor; the margin before
 // each MCU does not cover dense blocks.
-bool room_for_block(RowCoder& rc, EncoderContext* ctx) {
-    OutputTarget* t = target_of(ctx);
-    if (t->capacity - static_cast<uint64_t>(rc.bits.out - t->buffer) >= kBlockWorstCase + kPendingBytes) return true;
-    sync(rc, t);
-    bool ok = t->kind == EKO_OUTPUT_MEMORY ? grow_memory(ctx, t, kBlockWorstCase + kPendingBytes) : hand_on(ctx, t);
-    if (ok && t->capacity - t->used < kBlockWorstCase + kPendingBytes) {
-        fail(ctx, EKO_ERR_TOO_LARGE);
+bool room_for_block(RowCoder& rc) {
+    constexpr uint32_t kNeed = kBlockWorstCase + kPendingBytes;
+    OutputTarget* t = rc.sink.target;
+    if (t->capacity - static_cast<uint64_t>(rc.bits.out - t->buffer) >= kNeed) return true;
+    sync(rc);
+    bool ok = kind_of(t).make_room(rc.sink, kNeed);
+    if (ok && t->capacity - t->used < kNeed) {
+        fail(rc.sink, EKO_ERR_TOO_LARGE);
         ok = false;
     }
     rc.bits.out = t->buffer + t->used;
@@ -75,9 +73,9 @@ void write_restart(RowCoder& rc, int comps_in_scan) {
 }
 
 // The restart step, run before every MCU.
-bool restart_step(RowCoder& rc, EncoderContext* ctx, int comps_in_scan) {
+bool restart_step(RowCoder& rc, int comps_in_scan) {
     if (!rc.restart.tick()) return true;
-    if (!room_for_block(rc, ctx)) return false;
+    if (!room_for_block(rc)) return false;
     write_restart(rc, comps_in_scan);
     return true;
 }
@@ -145,33 +143,46 @@ void store_restart(EncoderContext* ctx, const RestartClock& clock) {
 void begin_coding(RowCoder& rc, EncoderContext* ctx) {
     const EntropyState* es = ctx->entropy;
     load_bits(rc.bits, es);
-    OutputTarget* t = target_of(ctx);
-    rc.bits.out = t->buffer + t->used;
+    rc.sink = sink_of(ctx);
+    rc.bits.out = rc.sink.target->buffer + rc.sink.target->used;
     for (int c = 0; c < 3; ++c) rc.last_dc[c] = es->last_dc_val[c];
     rc.restart = load_restart(ctx);
 }
 
 void end_coding(RowCoder& rc, EncoderContext* ctx) {
     EntropyState* es = ctx->entropy;
-    OutputTarget* t = target_of(ctx);
     store_bits(rc.bits, es);
+    OutputTarget* t = rc.sink.target;
     if (t->buffer != nullptr) t->used = static_cast<uint32_t>(rc.bits.out - t->buffer);
     for (int c = 0; c < 3; ++c) es->last_dc_val[c] = rc.last_dc[c];
     store_restart(ctx, rc.restart);
 }
 
-bool code_mcu(RowCoder& rc, EncoderContext* ctx, int16_t* const* blocks) {
-    const CoderTables* t = ctx->coder_tables;
-    if (!room_for_mcu(rc, ctx)) return false;
-    if (!restart_step(rc, ctx, t->comps_in_scan)) return false;
-    for (uint32_t n = 0; n < t->blocks_in_mcu; ++n) {
-        if (!room_for_block(rc, ctx)) return false;
-        const uint32_t c = t->block_comp[n];
+void start_row(RowCoder& rc, Sink sink) {
+    rc.bits = BitState{0, kAccBits, sink.target->buffer + sink.target->used};
+    rc.last_dc[0] = rc.last_dc[1] = rc.last_dc[2] = 0;
+    rc.restart = RestartClock{0, -1, 0, 0};
+    rc.sink = sink;
+}
+
+bool finish_row(RowCoder& rc) {
+    if (*rc.sink.failed != 0 || !room_for_block(rc)) return false;
+    pad_to_byte(rc.bits);
+    rc.sink.target->used = static_cast<uint32_t>(rc.bits.out - rc.sink.target->buffer);
+    return true;
+}
+
+bool code_mcu(RowCoder& rc, const CoderTables& t, int16_t* const* blocks) {
+    if (!room_for_mcu(rc, 128u * t.blocks_in_mcu)) return false;
+    if (!restart_step(rc, t.comps_in_scan)) return false;
+    for (uint32_t n = 0; n < t.blocks_in_mcu; ++n) {
+        if (!room_for_block(rc)) return false;
+        const uint32_t c = t.block_comp[n];
         int16_t* blk = blocks[n];
         int32_t diff = blk[0] - rc.last_dc[c];
         // The pixel path never exceeds category 11; a caller's blocks might.
         diff = diff > 2047 ? 2047 : (diff < -2047 ? -2047 : diff);
-        t->kernel(rc.bits, diff, blk, t->dc[t->block_dc[n]], t->ac[t->block_ac[n]]);
+        t.kernel(rc.bits, diff, blk, t.dc[t.block_dc[n]], t.ac[t.block_ac[n]]);
         blk[kZigzagToNatural[63]] = 0;
         rc.last_dc[c] = blk[0];
     }
@@ -182,7 +193,7 @@ bool encode_mcu(EncoderContext* ctx, int16_t* const* blocks) {
     if (ctx->failed != 0) return false;
     RowCoder rc;
     begin_coding(rc, ctx);
-    const bool ok = code_mcu(rc, ctx, blocks);
+    const bool ok = code_mcu(rc, *ctx->coder_tables, blocks);
     if (ok) end_coding(rc, ctx);
     return ok;
 }
@@ -234,8 +245,8 @@ tekoj::RowCoder coder_of(WorkingState* state) {
     tekoj::RowCoder rc;
     EntropyState es{state->put_buffer, state->put_bits, {0, 0, 0}, {nullptr, nullptr}, {nullptr, nullptr}};
     tekoj::load_bits(rc.bits, &es);
-    const OutputTarget* t = state->context->output;
-    rc.bits.out = t->buffer + t->used;
+    rc.sink = tekoj::sink_of(state->context);
+    rc.bits.out = rc.sink.target->buffer + rc.sink.target->used;
     for (int c = 0; c < 3; ++c) rc.last_dc[c] = state->last_dc_val[c];
     rc.restart = tekoj::load_restart(state->context);
     return rc;

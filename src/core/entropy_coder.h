@@ -10,6 +10,8 @@
 
 #include <TekoJEncoder.h>
 
+#include "sink/output_target.h"
+
 #include <cstdint>
 
 namespace tekoj {
@@ -96,11 +98,13 @@ struct RestartClock {
     }
 };
 
-// Everything that changes while one run of MCUs is coded.
+// Everything that changes while one run of MCUs is coded: the bits, the
+// predictors, the restart clock, and the target its bytes go to.
 struct RowCoder {
     BitState bits;
     int32_t last_dc[3];
     RestartClock restart;
+    Sink sink;
 };
 
 // Builds the context's CoderTables from its Huffman tables and MCU layout.
@@ -117,9 +121,17 @@ void store_restart(EncoderContext* ctx, const RestartClock& clock);
 void begin_coding(RowCoder& rc, EncoderContext* ctx);
 void end_coding(RowCoder& rc, EncoderContext* ctx);
 
-// Codes one MCU (restart marker first, when one is due). Returns false once
-// the encode has failed (its output could not be grown or handed on).
-bool code_mcu(RowCoder& rc, EncoderContext* ctx, int16_t* const* blocks);
+// A coder for one MCU row of its own, coded into `sink` from its current fill
+// count: empty accumulator, predictors 0, no restart markers (whoever joins
+// the rows puts them between). finish_row pads the last byte with 1-bits.
+void start_row(RowCoder& rc, Sink sink);
+bool finish_row(RowCoder& rc);
+
+// Codes one MCU (restart marker first, when one is due) with the encode's
+// read-only tables. Returns false once the coder's output has failed (it
+// could not be grown or handed on). Touches nothing but `rc`, its target and
+// the blocks, so coders of separate rows can run at once.
+bool code_mcu(RowCoder& rc, const CoderTables& tables, int16_t* const* blocks);
 
 // One MCU with the context's own coder state.
 bool encode_mcu(EncoderContext* ctx, int16_t* const* blocks);

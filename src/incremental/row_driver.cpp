@@ -1,7 +1,8 @@
 // Row entropy driver: codes one band of caller-supplied quantised
 // coefficient blocks exactly where the band driver would have coded the
 // blocks it computed itself, restart markers included.
-#include "api/output_target.h"
+#include "sink/output_target.h"
+#include "core/band_driver.h"
 #include "core/entropy_coder.h"
 #include "incremental/incremental.h"
 
@@ -57,7 +58,7 @@ uint32_t code_band(EncoderContext* ctx, McuBlockList* mcus, uint32_t* next_row_o
         st->mcu_ctr = 0;
     }
     ++st->imcu_row;
-    __eko_jpeg_enc_setup_imcu(ctx);
+    tekoj::setup_band(ctx);
     ctx->next_row = static_cast<uint16_t>(ctx->next_row + ctx->max_v_samp * 8u);
     *next_row_out = ctx->next_row;
     return 1;

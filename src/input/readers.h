@@ -1,12 +1,6 @@
 // Input readers: fill one band of component sample rows from the caller's
-// pixels, in the layout that the context's format code names.
+// pixels, in the layout that the context's format code names. The reader of
+// each format is found through its entry in the format table.
 #pragma once
 
-#include <TekoJEncoder.h>
-
-namespace tekoj {
-
-// Runs the reader of the context's format for the current band.
-void read_band(EncoderContext* ctx);
-
-}  // namespace tekoj
+#include "input/formats.h"

@@ -70,19 +70,3 @@ EKO_API uint32_t __eko_jpeg_enc_get_raw_pvu_data(EncoderContext* context) {
 }
 
 }  // extern "C"
-
-namespace tekoj {
-
-void read_band(EncoderContext* ctx) {
-    switch (ctx->format) {
-        case EKO_FORMAT_YUV420:
-        case EKO_FORMAT_GREY: __eko_jpeg_enc_get_raw_data(ctx); break;
-        case EKO_FORMAT_RGB565: __eko_jpeg_enc_get_raw_rgb565_data(ctx); break;
-        case EKO_FORMAT_RGB888: __eko_jpeg_enc_get_raw_rgb888_data(ctx); break;
-        case EKO_FORMAT_RGBA8888: __eko_jpeg_enc_get_raw_rgba8888_data(ctx); break;
-        case EKO_FORMAT_BGRA8888: __eko_jpeg_enc_get_raw_bgra8888_data(ctx); break;
-        default: break;
-    }
-}
-
-}  // namespace tekoj
