@@ -111,9 +111,10 @@ bool build_coder_tables(EncoderContext* ctx) {
     ctx->coder_tables = t;
     const EntropyState* es = ctx->entropy;
     for (int n = 0; n < 2; ++n) {
-        for (uint32_t k = 0; k < 12; ++k) t->dc[n][k] = combined(es->dc_codes[n]->code[k], es->dc_codes[n]->size[k], k);
-        for (uint32_t s = 0; s < 256; ++s)
-            t->ac[n][s] = combined(es->ac_codes[n]->code[s], es->ac_codes[n]->size[s], s & 15);
+        const DcCodeTable* dc = es->dc_codes[n];
+        const AcCodeTable* ac = es->ac_codes[n];
+        for (uint32_t k = 0; k < 12; ++k) t->dc[n][k] = combined(dc->code[k], dc->size[k], k);
+        for (uint32_t s = 0; s < 256; ++s) t->ac[n][s] = combined(ac->code[s], ac->size[s], s & 15);
     }
     t->kernel = block_kernel_for(static_cast<int>(simd_level()));
     t->blocks_in_mcu = ctx->blocks_in_mcu;
