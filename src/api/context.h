@@ -2,7 +2,7 @@
 // interface.
 #pragma once
 
-#include <TekoJEncoder.h>
+#include <TekoJEncoderInternal.h>
 
 namespace tekoj {
 
@@ -22,5 +22,11 @@ void release_buffers(EncoderContext* ctx);
 // Completes the stream: the last byte padded with 1-bits, EOI unless more
 // bands follow, the rest handed on or the memory stream's length fixed.
 bool complete_stream(EncoderContext* ctx, bool with_eoi);
+
+// The band sample rows of every component, allocated from the components'
+// geometry into the context's SampleRowSet (false after reporting error 3,
+// what was allocated left for release), and freed again.
+bool allocate_band_rows(EncoderContext* ctx);
+void release_band_rows(EncoderContext* ctx);
 
 }  // namespace tekoj

@@ -8,7 +8,7 @@
 // on one encode with the same tables.
 #pragma once
 
-#include <TekoJEncoder.h>
+#include <TekoJEncoderInternal.h>
 
 #include "sink/output_target.h"
 

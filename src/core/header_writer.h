@@ -1,7 +1,7 @@
 // Header writer: SOI, JFIF APP0, (EXIF APP1), DQT, SOF0, DHT, DRI and SOS.
 #pragma once
 
-#include <TekoJEncoder.h>
+#include <TekoJEncoderInternal.h>
 
 #include <cstdint>
 

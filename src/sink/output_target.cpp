@@ -135,10 +135,23 @@ bool discard_finish(Sink s) { return discard(s, 0); }
 
 bool write_pieces(Sink s, const uint8_t* data, uint32_t count) { return write_bytes(s, data, count); }
 
+// A callback takes long runs straight from the caller's memory, in pieces no
+// longer than its work buffer.
+bool stream_run(Sink s, const uint8_t* data, uint32_t count) {
+    if (!hand_on<false>(s, 0)) return false;
+    while (count > 0) {
+        const uint32_t piece = count < kWorkBufferSize ? count : kWorkBufferSize;
+        if (!deliver<false>(s, data, piece)) return false;
+        data += piece;
+        count -= piece;
+    }
+    return healthy(s);
+}
+
 constexpr SinkKind kMemory{grow_memory, memory_direct, write_pieces, memory_reserve, memory_finish, kMaxMemoryStream};
 constexpr SinkKind kFile{hand_on<true>, direct<true>, direct<true>, nothing_to_reserve, finish_handed_on<true>,
                          kWorkBufferSize};
-constexpr SinkKind kStream{hand_on<false>, direct<false>, write_pieces, nothing_to_reserve, finish_handed_on<false>,
+constexpr SinkKind kStream{hand_on<false>, direct<false>, stream_run, nothing_to_reserve, finish_handed_on<false>,
                            kWorkBufferSize};
 constexpr SinkKind kNowhere{discard, discard_direct, discard_direct, nothing_to_reserve, discard_finish,
                             kWorkBufferSize};

@@ -6,7 +6,7 @@
 // which kind it writes to.
 #pragma once
 
-#include <TekoJEncoder.h>
+#include <TekoJEncoderInternal.h>
 
 #include <cstdint>
 
@@ -59,7 +59,7 @@ struct SinkKind {
     bool (*write_direct)(Sink sink, const uint8_t* data, uint32_t count);
     // Passes a run of bytes on as this kind passes long runs: a memory block
     // copies it in, a file takes it in one piece, a stream callback in
-    // work-buffer pieces.
+    // pieces of at most 4096 bytes straight from `data`.
     bool (*write_run)(Sink sink, const uint8_t* data, uint32_t count);
     // Prepares for `count` more bytes: a memory block grows once to exactly
     // the size needed; the others need nothing.
