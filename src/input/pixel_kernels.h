@@ -85,4 +85,10 @@ static_assert(kYr + kYg + kYb == 4096 && kCbR + kCbG + kCbB == 0 && kCrR + kCrG 
 static_assert(kCbB == 2048 && kCrR == 2048);
 }  // namespace rgb
 
+// Two 16-bit weights in one 32-bit lane, `low` for the lane's low word: the
+// operand of pmaddwd-style multiply-adds.
+constexpr int32_t word_pair(int32_t low, int32_t high) {
+    return static_cast<int32_t>((static_cast<uint32_t>(low) & 0xFFFF) | (static_cast<uint32_t>(high) << 16));
+}
+
 }  // namespace tekoj
