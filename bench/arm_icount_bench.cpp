@@ -12,7 +12,7 @@
 // All codings are 4:2:0 (grey: one component) with the fast integer DCT, to
 // memory. The derived inputs (YUV planes, packed 4:2:2, RGB565) are built
 // before the repetitions, so their cost cancels out of the difference.
-#include <TekoJEncoder.h>
+#include <TekoJEncoderInternal.h>
 #include <turbojpeg.h>
 
 #include <cstdio>

@@ -6,7 +6,7 @@
 //   tekoj_bench [image.jpg|image.ppm] [repetitions]
 //
 // Set JSIMD_FORCENONE=1 to compare against libjpeg-turbo without its SIMD.
-#include <TekoJEncoder.h>
+#include <TekoJEncoderInternal.h>
 #include <turbojpeg.h>
 
 #include <algorithm>

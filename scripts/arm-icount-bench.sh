@@ -23,7 +23,7 @@ command -v qemu-arm >/dev/null 2>&1 || skip "no qemu-arm"
 [ -f "$IMAGE" ] || skip "no image $IMAGE"
 
 cmake -S . -B "$BUILD_DIR" -G Ninja -DCMAKE_BUILD_TYPE=Release -DCMAKE_TOOLCHAIN_FILE=cmake/toolchains/armhf.cmake \
-  -DTEKOJ_BUILD_TESTS=OFF -DTEKOJ_BUILD_TOOLS=OFF >/dev/null 2>&1 || skip "armhf configure failed"
+  -DTEKOJ_BUILD_BENCH=ON -DTEKOJ_BUILD_TESTS=OFF -DTEKOJ_BUILD_TOOLS=OFF >/dev/null 2>&1 || skip "armhf configure failed"
 cmake --build "$BUILD_DIR" -j 2 --target arm_icount_bench >/dev/null
 BIN=$BUILD_DIR/bench/arm_icount_bench
 RAW=$BUILD_DIR/frame-${W}x${H}.rgb

@@ -3,7 +3,7 @@
 // so each coefficient costs one multiply and one shift.
 #pragma once
 
-#include <TekoJEncoder.h>
+#include <TekoJEncoderInternal.h>
 
 #include <cstdint>
 
