@@ -71,6 +71,10 @@ struct Call {
 Call call_member(int m, const ImageInfo& info, uint32_t quality, const std::string& path, int32_t start = 0,
                  int64_t fail_at = -1);
 
+// The stream with its EXIF DateTime text ("YYYY:MM:DD HH:MM:SS") blanked:
+// the clock may tick between two encodes.
+Bytes without_date(Bytes jpeg);
+
 // Files.
 Bytes read_file(const std::string& path);
 bool file_exists(const std::string& path);
