@@ -257,10 +257,8 @@ EKO_API void __eko_jpeg_enc_release_mem(EncoderContext* context) {
     };
     if (ctx->sample_rows != nullptr) {
         for (uint32_t c = 0; c < ctx->num_components && c < 3; ++c) {
-            uint8_t** rows = ctx->sample_rows->row_arrays[c];
-            if (rows == nullptr) continue;
-            for (uint32_t r = 0; r < ctx->comp_info[c].band_rows; ++r) release(rows[r]);
-            release(rows);
+            // The row array and its rows are one block.
+            release(ctx->sample_rows->row_arrays[c]);
         }
         release(ctx->sample_rows);
     }

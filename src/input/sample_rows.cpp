@@ -2,26 +2,23 @@
 // plane followed by an interleaved V/U plane).
 #include "input/edge_fill.h"
 #include "input/readers.h"
+#include "input/sample_row_layout.h"
 
 extern "C" {
 
 EKO_API uint8_t** __eko_jpeg_enc_alloc_sample_arry(EncoderContext* context, uint32_t row_length,
                                                    uint32_t row_count) {
     (void)context;
-    auto** rows = static_cast<uint8_t**>(DORVATEKO_OsMalloc(row_count * static_cast<uint32_t>(sizeof(uint8_t*))));
-    if (rows == nullptr) {
+    // One block: the row pointers, then the rows at a fixed aligned stride.
+    const tekoj::SampleRowLayout layout = tekoj::sample_row_layout(row_length, row_count);
+    auto* block = static_cast<uint8_t*>(DORVATEKO_OsMalloc(layout.block_size));
+    if (block == nullptr) {
         eko_SetError(EKO_ERR_ALLOC);
         return nullptr;
     }
-    for (uint32_t r = 0; r < row_count; ++r) {
-        rows[r] = static_cast<uint8_t*>(DORVATEKO_OsMalloc(row_length));
-        if (rows[r] == nullptr) {
-            for (uint32_t k = 0; k < r; ++k) DORVATEKO_OsFree(rows[k]);
-            DORVATEKO_OsFree(rows);
-            eko_SetError(EKO_ERR_ALLOC);
-            return nullptr;
-        }
-    }
+    auto** rows = reinterpret_cast<uint8_t**>(block);
+    uint8_t* first = tekoj::first_sample_row(rows, row_count);
+    for (uint32_t r = 0; r < row_count; ++r) rows[r] = first + static_cast<size_t>(r) * layout.stride;
     return rows;
 }
 
