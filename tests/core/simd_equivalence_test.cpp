@@ -8,6 +8,7 @@
 #include "core/forward_dct.h"
 #include "core/quant_tables.h"
 #include "core/simd_level.h"
+#include "input/vu_split.h"
 #include "support/test_support.h"
 
 #include <gtest/gtest.h>
@@ -132,6 +133,24 @@ TEST(SimdEquivalence, PortableKernelMatchesTheWideReference) {
             tekoj::dct_detail::block(
                 rows, 0, [&](int i, int32_t x) { return tekoj::dct_detail::quantise_wide(x, d[i]); }, want);
             ASSERT_EQ(std::memcmp(got, want, sizeof got), 0);
+        }
+    }
+}
+
+TEST(SimdEquivalence, VuSplitKernelsMatchThePortableOne) {
+    // Every length up to several vector widths, from a heap block that ends
+    // with the last pair.
+    for (tekoj::SimdLevel level : kLevels) {
+        if (!tekoj::simd_supported(level)) continue;
+        const tekoj::SplitVuFn split = tekoj::split_vu_for(level);
+        ASSERT_NE(split, &tekoj::split_vu_portable) << tekoj::simd_level_name(level);
+        for (uint32_t n = 0; n <= 70; ++n) {
+            const auto src = std::make_unique<uint8_t[]>(2 * n + (n == 0));
+            for (uint32_t i = 0; i < 2 * n; ++i) src[i] = static_cast<uint8_t>(i * 37 + n);
+            Bytes cr(n + 1, 0xEE), cb(n + 1, 0xEE), want_cr(n + 1, 0xEE), want_cb(n + 1, 0xEE);
+            split(src.get(), n, cr.data(), cb.data());
+            tekoj::split_vu_portable(src.get(), n, want_cr.data(), want_cb.data());
+            EXPECT_TRUE(cr == want_cr && cb == want_cb) << tekoj::simd_level_name(level) << " n=" << n;
         }
     }
 }
