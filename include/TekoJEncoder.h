@@ -39,7 +39,8 @@ typedef enum EkoError {
     EKO_ERR_ARGUMENT = 20,    /* a null pointer or an out-of-range argument */
     EKO_ERR_WRITE = 21,       /* the file refused bytes (disc full, I/O error) */
     EKO_ERR_TOO_LARGE = 22,   /* the stream or a segment exceeds its length field */
-    EKO_ERR_STATE = 23        /* call out of order (e.g. a band after the last) */
+    EKO_ERR_STATE = 23,       /* call out of order (e.g. a band after the last) */
+    EKO_ERR_OPEN = 24         /* the output file could not be opened */
 } EkoError;
 
 /* ------------------------------------------------------------------------ */
@@ -343,7 +344,9 @@ EKO_API int32_t DORVATEKO_OsFclose(void* file);
 /* ------------------------------------------------------------------------ */
 
 EKO_API void eko_SetError(uint32_t code);
-/* The last code passed to eko_SetError on the calling thread (0 if none). */
+/* The reason of the last call on the calling thread: every exported call
+ * that can fail starts from EKO_OK, so after a success this is 0 and after a
+ * failure the code belongs to that call. */
 EKO_API uint32_t eko_GetLastError(void);
 
 /* ------------------------------------------------------------------------ */
@@ -357,6 +360,20 @@ EKO_API uint32_t eko_enc_jpeg_to_file_full_buffer(const ImageInfo* image_info, O
                                                   uint32_t quality);
 EKO_API uint32_t eko_enc_jpeg_to_file_ex_full_buffer(const ImageInfo* image_info, OutputRequest* request,
                                                      const EncodeOptions* options);
+/* Ownership of the memory block after the buffer members (and the request's
+ * block of the _full_buffer members) return:
+ *  - 1: the variables hold the stream's block, which may differ from the one
+ *    passed in (that one has then been freed), and the stream's length; the
+ *    caller frees the block with DORVATEKO_OsFree.
+ *  - 0 with a non-null block: the call was refused or creation failed before
+ *    any byte was written. The caller's variables are as they were, and the
+ *    block is still the caller's. (eko_enc_jpeg_to_buffer first enlarges a
+ *    block shorter than 2048 bytes; after that the variables hold the
+ *    enlarged block and 2048.)
+ *  - 0 with null and 0: the encode failed while writing (the block could not
+ *    grow, or the stream outgrew its length field); the library has already
+ *    freed the block. Nothing is left to free.
+ * So a non-null block after any result is the caller's to free. */
 EKO_API uint32_t eko_enc_jpeg_to_buffer(const ImageInfo* image_info, uint8_t** buffer_io, int32_t* length_io,
                                         uint32_t quality);
 EKO_API uint32_t eko_enc_jpeg_to_buffer_ex(const ImageInfo* image_info, uint8_t** buffer_io, int32_t* length_io,

@@ -23,6 +23,7 @@ constexpr std::string_view error_message(uint32_t code) {
         case EKO_ERR_WRITE: return "writing the output failed";
         case EKO_ERR_TOO_LARGE: return "output larger than its length field can describe";
         case EKO_ERR_STATE: return "call out of order";
+        case EKO_ERR_OPEN: return "the output file could not be opened";
         default: return "unknown error";
     }
 }

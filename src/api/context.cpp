@@ -30,6 +30,9 @@ bool settings_usable(const EncoderContext* ctx) {
     for (uint32_t c = 0; c < n; ++c) {
         const uint8_t* spec = s->component_specs[c];
         if (spec[0] >= tables) return false;
+        // A single component's header carries table 0 alone (see the header
+        // writer), so a component naming another table would be undecodable.
+        if (n == 1 && spec[0] != 0) return false;
         if (n == 3 && (spec[1] == 0 || spec[2] == 0)) return false;
     }
     if (ctx->format == EKO_FORMAT_GREY && n != 1) return false;
@@ -58,6 +61,7 @@ extern "C" {
 
 EKO_API EncoderContext* __eko_jpeg_enc_initiaize(const ImageInfo* image_info, const OutputRequest* output_request,
                                                  const EncodeOptions* options, const EncoderSettings* settings) {
+    eko_SetError(EKO_OK);
     if (image_info == nullptr || output_request == nullptr || options == nullptr) {
         eko_SetError(EKO_ERR_ARGUMENT);
         return nullptr;

@@ -30,8 +30,15 @@ struct Result {
     uint32_t total;
 };
 
+// The caller's pixels must be there: every reader loads through `data`.
+bool image_given(const ImageInfo* info) { return info != nullptr && info->data != nullptr; }
+
 Result run(const ImageInfo* info, const OutputRequest& request, const EncodeOptions* options,
            EkoStreamCallback callback, void* callback_arg, bool allow_bands) {
+    if (!image_given(info)) {
+        eko_SetError(EKO_ERR_ARGUMENT);
+        return {Outcome::CreationFailed, nullptr, 0};
+    }
     EncoderContext* ctx = __eko_jpeg_enc_initiaize(info, &request, options, nullptr);
     if (ctx == nullptr) return {Outcome::CreationFailed, nullptr, 0};
     if (request.kind == EKO_OUTPUT_STREAM) {
@@ -83,8 +90,15 @@ Result run(const ImageInfo* info, const OutputRequest& request, const EncodeOpti
 uint32_t to_file(const ImageInfo* info, void* file, const EncodeOptions* options) {
     OutputRequest request{EKO_OUTPUT_FILE, file, nullptr, 0};
     const Result r = run(info, request, options, nullptr, nullptr, false);
-    DORVATEKO_OsFclose(file);
-    return r.outcome == Outcome::Done ? 1 : 0;
+    // The C library may still hold the stream's tail: a close that fails
+    // means the file is incomplete, whatever the writes said.
+    const bool closed = DORVATEKO_OsFclose(file) == 0;
+    if (r.outcome != Outcome::Done) return 0;
+    if (!closed) {
+        eko_SetError(EKO_ERR_WRITE);
+        return 0;
+    }
+    return 1;
 }
 
 uint32_t refuse() {
@@ -92,21 +106,16 @@ uint32_t refuse() {
     return 0;
 }
 
-// The buffer members' common run. A refused or failed creation hands back
-// null and 0 without freeing the caller's block, which the caller still
-// holds; a block that the library itself (re)allocated for the call
-// (`owns_block`) would be lost that way, so it is freed instead.
-uint32_t to_buffer(const ImageInfo* info, uint8_t** buffer_io, int32_t* length_io, const EncodeOptions* options,
-                   bool owns_block) {
+// The buffer members' common run. A refused call or a failed creation wrote
+// nothing and leaves the caller's variables, and so the block, with the
+// caller; a failure while coding has freed the block and hands back null
+// and 0. A non-null block after a 0 result is therefore always the caller's.
+uint32_t to_buffer(const ImageInfo* info, uint8_t** buffer_io, int32_t* length_io, const EncodeOptions* options) {
     if (buffer_io == nullptr || length_io == nullptr) return refuse();
-    Result r{Outcome::CreationFailed, nullptr, 0};
-    if (info == nullptr || *length_io < 0 || !band_words_valid(info)) {
-        eko_SetError(EKO_ERR_ARGUMENT);
-    } else {
-        const OutputRequest request{EKO_OUTPUT_MEMORY, nullptr, *buffer_io, static_cast<uint32_t>(*length_io)};
-        r = run(info, request, options, nullptr, nullptr, true);
-    }
-    if (r.outcome == Outcome::CreationFailed && owns_block && *buffer_io != nullptr) DORVATEKO_OsFree(*buffer_io);
+    if (info == nullptr || *length_io < 0 || !band_words_valid(info)) return refuse();
+    const OutputRequest request{EKO_OUTPUT_MEMORY, nullptr, *buffer_io, static_cast<uint32_t>(*length_io)};
+    const Result r = run(info, request, options, nullptr, nullptr, true);
+    if (r.outcome == Outcome::CreationFailed) return 0;
     *buffer_io = r.buffer;
     *length_io = static_cast<int32_t>(r.total);
     return r.outcome == Outcome::Done ? 1 : 0;
@@ -119,9 +128,14 @@ extern "C" {
 
 EKO_API uint32_t eko_enc_jpeg_to_file_ex(const ImageInfo* image_info, const char* file_name,
                                          const EncodeOptions* options) {
-    if (file_name == nullptr) return tekoj::refuse();
+    eko_SetError(EKO_OK);
+    // Refused before the open, so that a refused call leaves no empty file.
+    if (file_name == nullptr || !tekoj::image_given(image_info) || options == nullptr) return tekoj::refuse();
     void* file = DORVATEKO_OsFopen(file_name, "wb");
-    if (file == nullptr) return tekoj::refuse();
+    if (file == nullptr) {
+        eko_SetError(EKO_ERR_OPEN);
+        return 0;
+    }
     return tekoj::to_file(image_info, file, options);
 }
 
@@ -132,6 +146,7 @@ EKO_API uint32_t eko_enc_jpeg_to_file(const ImageInfo* image_info, const char* f
 
 EKO_API uint32_t eko_enc_jpeg_to_file_ex_full_buffer(const ImageInfo* image_info, OutputRequest* request,
                                                      const EncodeOptions* options) {
+    eko_SetError(EKO_OK);
     if (request == nullptr || request->file == nullptr) return tekoj::refuse();
     return tekoj::to_file(image_info, request->file, options);
 }
@@ -144,13 +159,16 @@ EKO_API uint32_t eko_enc_jpeg_to_file_full_buffer(const ImageInfo* image_info, O
 
 EKO_API uint32_t eko_enc_jpeg_to_buffer_ex(const ImageInfo* image_info, uint8_t** buffer_io, int32_t* length_io,
                                            const EncodeOptions* options) {
-    return tekoj::to_buffer(image_info, buffer_io, length_io, options, false);
+    eko_SetError(EKO_OK);
+    return tekoj::to_buffer(image_info, buffer_io, length_io, options);
 }
 
 EKO_API uint32_t eko_enc_jpeg_to_buffer(const ImageInfo* image_info, uint8_t** buffer_io, int32_t* length_io,
                                         uint32_t quality) {
+    eko_SetError(EKO_OK);
     if (buffer_io == nullptr || length_io == nullptr || *length_io < 0) return tekoj::refuse();
-    bool replaced = false;
+    // Refused before the block is touched.
+    if (!tekoj::image_given(image_info) || !tekoj::band_words_valid(image_info)) return tekoj::refuse();
     if (*length_io < static_cast<int32_t>(tekoj::kMinMemoryBlock)) {
         void* grown = DORVATEKO_OsRealloc(*buffer_io, tekoj::kMinMemoryBlock);
         if (grown == nullptr) {
@@ -160,15 +178,15 @@ EKO_API uint32_t eko_enc_jpeg_to_buffer(const ImageInfo* image_info, uint8_t** b
         }
         *buffer_io = static_cast<uint8_t*>(grown);
         *length_io = static_cast<int32_t>(tekoj::kMinMemoryBlock);
-        replaced = true;
     }
     const EncodeOptions options{quality, nullptr, 0};
-    return tekoj::to_buffer(image_info, buffer_io, length_io, &options, replaced);
+    return tekoj::to_buffer(image_info, buffer_io, length_io, &options);
 }
 
 EKO_API uint32_t eko_enc_jpeg_to_buffer_ex_full_buffer(const ImageInfo* image_info, OutputRequest* request,
                                                        const EncodeOptions* options) {
     using namespace tekoj;
+    eko_SetError(EKO_OK);
     if (request == nullptr) return refuse();
     OutputRequest mine{EKO_OUTPUT_MEMORY, nullptr, request->buffer, request->capacity};
     const Result r = run(image_info, mine, options, nullptr, nullptr, false);
@@ -186,6 +204,7 @@ EKO_API uint32_t eko_enc_jpeg_to_buffer_full_buffer(const ImageInfo* image_info,
 
 EKO_API uint32_t eko_enc_jpeg_to_stream_ex(const ImageInfo* image_info, EkoStreamCallback callback,
                                            const EncodeOptions* options, void* callback_arg) {
+    eko_SetError(EKO_OK);
     if (callback == nullptr) return tekoj::refuse();
     const OutputRequest request{EKO_OUTPUT_STREAM, nullptr, nullptr, 0};
     return tekoj::run(image_info, request, options, callback, callback_arg, false).outcome == tekoj::Outcome::Done
@@ -195,6 +214,7 @@ EKO_API uint32_t eko_enc_jpeg_to_stream_ex(const ImageInfo* image_info, EkoStrea
 
 EKO_API uint32_t eko_enc_jpeg_to_stream(const ImageInfo* image_info, EkoStreamCallback callback, uint32_t quality,
                                         void* callback_arg) {
+    eko_SetError(EKO_OK);
     if (callback == nullptr || callback_arg == nullptr) return tekoj::refuse();
     const EncodeOptions options{quality, nullptr, 0};
     return eko_enc_jpeg_to_stream_ex(image_info, callback, &options, callback_arg);

@@ -144,6 +144,7 @@ void convert_frame(const Source& src, const uint8_t* luma, size_t width, size_t 
 }
 
 inline bool usable(const uint8_t* source, int32_t width, int32_t height, const uint16_t* destination) {
+    eko_SetError(!source || !destination ? EKO_ERR_ARGUMENT : width <= 0 || height <= 0 ? EKO_ERR_DIMENSIONS : EKO_OK);
     return source != nullptr && destination != nullptr && width > 0 && height > 0;
 }
 

@@ -210,6 +210,8 @@ void format_exif_date(const std::tm& local, char out[kExifDateLength + 1]) {
 extern "C" {
 
 EKO_API uint32_t __eko_CreateExif(uint8_t* dst, const ExifInfo* exif) {
+    eko_SetError(EKO_OK);
+    if (dst == nullptr) return eko_SetError(EKO_ERR_ARGUMENT), 0u;  // a real block is never empty
     const ExifInfo& e = exif != nullptr ? *exif : kNoDescription;
     char date[tekoj::kExifDateLength + 1] = {};
     if (e.stamp_date_time != 0) stamp_now(date);

@@ -173,6 +173,7 @@ extern "C" {
 
 EKO_API uint32_t __eko_jpeg_enc_col_encoder_init(EncoderContext* context) {
     using namespace tekoj;
+    eko_SetError(EKO_OK);
     if (context == nullptr) return refuse(EKO_ERR_ARGUMENT);
     // The row buffers are sized from the settings record; and without a
     // restart interval in the header the markers of the join would be
@@ -194,6 +195,7 @@ EKO_API uint32_t __eko_jpeg_enc_col_encoder_init(EncoderContext* context) {
 EKO_API uint32_t __eko_jpeg_enc_col_entroy_encoder(EncoderContext* context, McuBlockList* mcus,
                                                    uint32_t* next_col_out) {
     using namespace tekoj;
+    eko_SetError(EKO_OK);
     if (context == nullptr || mcus == nullptr || next_col_out == nullptr) return refuse(EKO_ERR_ARGUMENT);
     if (context->failed != 0) return refuse(context->failed);
     if (context->columns == nullptr || context->col_next_row >= columns_width(context)) return refuse(EKO_ERR_STATE);
@@ -216,6 +218,7 @@ EKO_API uint32_t __eko_jpeg_enc_col_entroy_encoder(EncoderContext* context, McuB
 
 EKO_API uint32_t __eko_jpeg_enc_col_encoder_finish(EncoderContext* context) {
     using namespace tekoj;
+    eko_SetError(EKO_OK);
     if (context == nullptr) return refuse(EKO_ERR_ARGUMENT);
     if (context->columns == nullptr) return 1;
     if (context->failed != 0) {

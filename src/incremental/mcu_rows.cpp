@@ -39,8 +39,14 @@ bool reads_band_buffer(const EncoderContext* ctx) {
 }
 
 uint32_t band_call(EncoderContext* ctx, const uint8_t* band, uint32_t* next_row_out) {
+    eko_SetError(EKO_OK);
     if (ctx == nullptr || next_row_out == nullptr) return refuse(EKO_ERR_ARGUMENT);
     if (band == nullptr && reads_band_buffer(ctx)) return refuse(EKO_ERR_ARGUMENT);
+    // RGB readers take the whole image from ImageInfo.data.
+    if (!reads_band_buffer(ctx) && ctx->read_ptr == nullptr) return refuse(EKO_ERR_ARGUMENT);
+    // Refused here rather than at init: the row and column drivers serve
+    // these samplings from the caller's coefficients.
+    if (!band_regions_fit(ctx)) return refuse(EKO_ERR_SAMPLING);
     if (!may_code_rows(ctx)) return 0;
 
     if (band != nullptr) {
@@ -101,13 +107,9 @@ extern "C" {
 
 EKO_API EncoderContext* eko_jpeg_enc_mcu_init(const ImageInfo* image_info, const OutputRequest* output_request,
                                               const EncodeOptions* options, const EncoderSettings* settings) {
+    eko_SetError(EKO_OK);
     EncoderContext* ctx = __eko_jpeg_enc_initiaize(image_info, output_request, options, settings);
     if (ctx == nullptr) return nullptr;
-    if (!tekoj::band_regions_fit(ctx)) {
-        tekoj::release_context(ctx);
-        eko_SetError(EKO_ERR_SAMPLING);
-        return nullptr;
-    }
     // The EXIF pointer stays null: this interface never writes APP1. A header
     // that could not be written (a memory block that failed to grow, which
     // also frees the caller's block) leaves the context failed rather than
@@ -120,6 +122,7 @@ EKO_API EncoderContext* eko_jpeg_enc_mcu_init(const ImageInfo* image_info, const
 EKO_API uint32_t eko_jpeg_enc_mcu_set_stream(EncoderContext* context, EkoStreamCallback callback,
                                              void* callback_arg) {
     using namespace tekoj;
+    eko_SetError(EKO_OK);
     if (context == nullptr || callback == nullptr) return refuse(EKO_ERR_ARGUMENT);
     OutputTarget* t = main_target(context);
     if (t->kind != EKO_OUTPUT_STREAM) return refuse(EKO_ERR_ARGUMENT);
@@ -141,12 +144,14 @@ EKO_API uint32_t eko_jpeg_enc_col_muc_process(EncoderContext* context, const uin
 
 EKO_API uint8_t* eko_jpeg_enc_mcu__get_encdata(EncoderContext* context, uint8_t** buffer_out,
                                                uint32_t* length_out) {
+    eko_SetError(EKO_OK);
     if (context == nullptr || buffer_out == nullptr || length_out == nullptr) {
         eko_SetError(EKO_ERR_ARGUMENT);
         return nullptr;
     }
     if (context->failed != 0 || context->finished != 0) {
         // The buffer may be gone or hold a stream that will never be valid.
+        eko_SetError(context->failed != 0 ? context->failed : uint32_t{EKO_ERR_STATE});
         *buffer_out = nullptr;
         *length_out = 0;
         return nullptr;
@@ -158,6 +163,7 @@ EKO_API uint8_t* eko_jpeg_enc_mcu__get_encdata(EncoderContext* context, uint8_t*
 
 EKO_API void eko_jpeg_enc_mcu_finish(EncoderContext* context, uint8_t** buffer_out, uint32_t* length_out) {
     using namespace tekoj;
+    eko_SetError(EKO_OK);
     if (context == nullptr) return;
     if (context->columns != nullptr) {
         // Column-split rows that were never joined are missing from the
@@ -173,8 +179,9 @@ EKO_API void eko_jpeg_enc_mcu_finish(EncoderContext* context, uint8_t** buffer_o
     if (context->failed == 0) {
         buffer = t->buffer;
         length = t->total;
-    } else if (t->kind == EKO_OUTPUT_MEMORY && t->buffer != nullptr) {
-        DORVATEKO_OsFree(t->buffer);
+    } else {
+        eko_SetError(context->failed);  // why no stream comes back, even if an earlier call said so
+        if (t->kind == EKO_OUTPUT_MEMORY && t->buffer != nullptr) DORVATEKO_OsFree(t->buffer);
         t->buffer = nullptr;
     }
     if (buffer_out != nullptr) *buffer_out = buffer;

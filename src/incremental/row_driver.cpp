@@ -41,6 +41,7 @@ bool band_codable(EncoderContext* ctx, const McuBlockList* mcus, uint32_t count)
 }
 
 uint32_t code_band(EncoderContext* ctx, McuBlockList* mcus, uint32_t* next_row_out) {
+    eko_SetError(EKO_OK);
     if (ctx == nullptr || mcus == nullptr || next_row_out == nullptr) return refuse(EKO_ERR_ARGUMENT);
     if (!may_code_rows(ctx)) return 0;
     if (!band_codable(ctx, mcus, mcus_left_in_band(ctx))) return refuse(EKO_ERR_ARGUMENT);

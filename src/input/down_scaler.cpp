@@ -102,6 +102,7 @@ extern "C" {
 
 EKO_API void __eko_jpeg_enc_write_yuv_to_yuv420(const uint32_t* words, int32_t count, Yuv420Cursor* cursor,
                                                 int32_t row_index) {
+    eko_SetError(EKO_OK);
     if (words == nullptr || cursor == nullptr || count <= 0) {
         eko_SetError(EKO_ERR_ARGUMENT);
         return;
@@ -138,6 +139,7 @@ EKO_API void __eko_jpeg_enc_write_yuv_to_yuv420(const uint32_t* words, int32_t c
 EKO_API void __eko_jpeg_enc_down_scale_yuv422(const uint8_t* source, int32_t source_width, int32_t source_height,
                                               int32_t source_stride, uint8_t* destination,
                                               int32_t destination_width, int32_t destination_height) {
+    eko_SetError(EKO_OK);
     if (!acceptable(source, source_width, source_height, source_stride, destination, destination_width,
                     destination_height)) {
         eko_SetError(EKO_ERR_ARGUMENT);

@@ -86,7 +86,8 @@ extern "C" {
 
 EKO_API uint32_t __eko_jpeg_enc_get_raw_duoview422_data(EncoderContext* context) {
     Band band{};
-    if (!band_of(context, 2, band)) return 0;
+    eko_SetError(EKO_OK);
+    if (!band_of(context, 2, band)) return eko_SetError(context ? EKO_ERR_SAMPLING : EKO_ERR_ARGUMENT), 0u;
     const uint32_t groups = band.comp[0]->downsampled_width >> 1;
     if (groups == 0) {
         fill_no_data(band);
@@ -115,7 +116,8 @@ EKO_API uint32_t __eko_jpeg_enc_get_raw_duoview422_data(EncoderContext* context)
 
 EKO_API uint32_t __eko_jpeg_enc_get_raw_duoview422_data_for_yuv422(EncoderContext* context) {
     Band band{};
-    if (!band_of(context, 1, band)) return 0;
+    eko_SetError(EKO_OK);
+    if (!band_of(context, 1, band)) return eko_SetError(context ? EKO_ERR_SAMPLING : EKO_ERR_ARGUMENT), 0u;
     const uint32_t groups = band.comp[0]->downsampled_width >> 1;
     if (groups == 0) {
         fill_no_data(band);

@@ -1,15 +1,20 @@
-// Failing allocations and short file writes: every entry point returns 0,
-// reports the reason, leaks no block, closes its file and leaves the caller's
-// variables as its failure rows say; the first call that is let through
-// gives the normal stream.
+// Failures from outside: every allocation of every entry point, of the EXIF
+// path and of the incremental interface made to fail in turn, and files that
+// refuse bytes (a short write, a full disc). Each failure returns the defined
+// result with its code, leaks no block, leaves no file open and leaves the
+// caller's variables as the header says; the first call let through gives
+// the normal stream.
 #include <TekoJEncoder.h>
 
+#include "incremental/incremental_support.h"
 #include "support/fault_os_layer.h"
 #include "support/test_support.h"
 
 #include <gtest/gtest.h>
 
+#include <cctype>
 #include <filesystem>
+#include <iostream>
 #include <string>
 
 using namespace tekoj_test;
@@ -32,100 +37,156 @@ struct NoLeak {
     }
 };
 
-uint32_t append(void* arg, const uint8_t* data, uint32_t count) {
-    static_cast<Bytes*>(arg)->insert(static_cast<Bytes*>(arg)->end(), data, data + count);
-    return count;
-}
-
 Bytes noise(size_t n, uint32_t seed) {
     Bytes b(n);
     for (auto& v : b) v = static_cast<uint8_t>((seed = seed * 1664525u + 1013904223u) >> 24);
     return b;
 }
 
-const std::string kPath = temp_path("alloc_failure.jpg");
-
-// Kinds: 0 buffer with a null block, 1 buffer with a 100-byte block, 2
-// buffer_ex, 3 buffer full buffer, 4 file by name, 5 file by handle, 6 stream.
-// Encodes through one output kind with the n-th allocation of the entry point
-// failing (its own set-up not counted) and frees what the caller owns. After
-// a failure the memory kinds' variables hold null and 0, except when the very
-// first step, growing a small block to 2048, fails: the caller's block is then
-// untouched and still the caller's.
-uint32_t run_kind(int kind, const ImageInfo& info, Bytes& out, int64_t n) {
-    const int32_t start = kind == 1 ? 100 : 0;
-    uint8_t* const block = start ? static_cast<uint8_t*>(DORVATEKO_OsMalloc(start)) : nullptr;
-    uint8_t* buffer = block;
-    int32_t length = start;
-    OutputRequest request{uint32_t(kind == 5 ? EKO_OUTPUT_FILE : EKO_OUTPUT_MEMORY),
-                          kind == 5 ? DORVATEKO_OsFopen(kPath.c_str(), "wb") : nullptr, nullptr, 0};
-    const EncodeOptions options{90, nullptr, 0};
-    reset_counters();
-    fail_allocation(n);
-    uint32_t r = 0;
-    switch (kind) {
-        case 0: case 1: r = eko_enc_jpeg_to_buffer(&info, &buffer, &length, 90); break;
-        case 2: r = eko_enc_jpeg_to_buffer_ex(&info, &buffer, &length, &options); break;
-        case 3: r = eko_enc_jpeg_to_buffer_full_buffer(&info, &request, 90); break;
-        case 4: r = eko_enc_jpeg_to_file(&info, kPath.c_str(), 90); break;
-        case 5: r = eko_enc_jpeg_to_file_full_buffer(&info, &request, 90); break;
-        default: r = eko_enc_jpeg_to_stream(&info, append, 90, &out);
+// The stream with its DateTime text ("YYYY:MM:DD HH:MM:SS") blanked: the
+// clock may tick between two encodes.
+Bytes without_date(Bytes b) {
+    static const char kPattern[] = "dddd:dd:dd dd:dd:dd";
+    for (size_t i = 0; i + 19 <= b.size(); ++i) {
+        size_t k = 0;
+        while (k < 19 && (kPattern[k] == 'd' ? std::isdigit(b[i + k]) != 0 : b[i + k] == uint8_t(kPattern[k]))) ++k;
+        if (k == 19) std::fill(b.begin() + long(i), b.begin() + long(i + 19), uint8_t('#'));
     }
-    fail_allocation(-1);
-    if (kind == 3) buffer = request.buffer, length = static_cast<int32_t>(request.capacity);
-    if (kind == 4 || kind == 5) out = read_file(kPath);
-    if (kind <= 3 && r == 1) out.assign(buffer, buffer + length);
-    if (kind <= 3 && r == 0) { EXPECT_TRUE((block && buffer == block && length == start) || (!buffer && !length)); }
-    DORVATEKO_OsFree(buffer);
-    return r;
+    return b;
 }
+
+const std::string kPath = temp_path("faults.jpg");
 
 }  // namespace
 
-TEST(AllocationFailure, EveryFailingAllocationFailsTheCallWithoutALeak) {
-    for (uint32_t format : {EKO_FORMAT_RGB888, EKO_FORMAT_GREY}) {
-        const Bytes px = noise(image_size(format, 96, 90), 77);
-        const ImageInfo info = image_info(px.data(), 96, 90, format);
-        const Bytes expected = encode_to_memory(info, 90);
-        ASSERT_GT(expected.size(), 6144u);  // memory targets must grow while coding
-        for (int kind = 0; kind < 7; ++kind) {
-            SCOPED_TRACE("kind " + std::to_string(kind) + ", format " + std::to_string(format));
-            uint32_t r = 0;
-            int64_t n = 0;
-            for (; r == 0 && n < 1000; ++n) {
-                SCOPED_TRACE("allocation " + std::to_string(n) + " fails");
-                NoLeak no_leak;
-                eko_SetError(EKO_OK);
-                Bytes out;
-                r = run_kind(kind, info, out, n);
-                if (r == 0) { EXPECT_EQ(eko_GetLastError(), uint32_t(EKO_ERR_ALLOC)); }
-                else { EXPECT_EQ(out, expected); }
+TEST(AllocationFailure, EveryPointOfEveryEntryPointFailsCleanly) {
+    struct Sweep {
+        std::string what;
+        std::function<Bytes(int64_t)> run;  // the stream, empty when the call failed
+        bool whole_image;                   // one call: its code must be the allocation's
+    };
+    std::vector<Sweep> sweeps;
+    // Whole images large enough that memory targets grow while coding.
+    const Bytes rgb = noise(image_size(EKO_FORMAT_RGB888, 96, 90), 77), grey = noise(96 * 90, 78);
+    const ImageInfo images[] = {image_info(rgb.data(), 96, 90, EKO_FORMAT_RGB888),
+                                image_info(grey.data(), 96, 90, EKO_FORMAT_GREY)};
+    for (const ImageInfo& info : images)
+        for (int m = 0; m < kMembers; ++m)
+            for (int32_t start : {0, 100}) {
+                if (start != 0 && m != kToBuffer) continue;  // only that member enlarges a short block first
+                sweeps.push_back({member_name(m) + " format " + std::to_string(info.format) + " block " +
+                                      std::to_string(start),
+                                  [&info, m, start](int64_t n) {
+                                      const Call c = call_member(m, info, 90, kPath, start, n);
+                                      return c.result == 1 ? c.out : Bytes{};
+                                  },
+                                  true});
             }
-            EXPECT_EQ(r, 1u);
-            EXPECT_GT(n, 10);  // creation alone allocates more than ten blocks
+    // EXIF: an APP1 segment longer than a work buffer, the date stamp, GPS
+    // and a thumbnail, on every target.
+    const std::string make(3000, 'M'), model(1500, 'm');
+    const Bytes thumb = encode_to_memory(images[0], 50);
+    GpsInfo gps{};
+    gps.processing_method = "GPS";
+    ExifInfo exif{};
+    exif.make = make.c_str(), exif.model = model.c_str(), exif.stamp_date_time = 1, exif.gps = &gps;
+    exif.has_thumbnail = 1, exif.thumb_length = uint32_t(thumb.size()), exif.thumb_data = thumb.data();
+    ImageInfo with_exif = images[0];
+    with_exif.exif_info = &exif;
+    for (int m : {kToBuffer, kToFile, kToStream})
+        sweeps.push_back({"EXIF " + member_name(m), [&, m](int64_t n) {
+                              const Call c = call_member(m, with_exif, 90, kPath, 0, n);
+                              return c.result == 1 ? c.out : Bytes{};
+                          }, true});
+    // MCU-row interface, row driver and column-split on every target; ten
+    // MCU rows whose 4096-byte row buffers must grow.
+    const Bytes yuv = noise(image_size(EKO_FORMAT_YUV420, 128, 160), 79);
+    const ImageInfo planar = image_info(yuv.data(), 128, 160, EKO_FORMAT_YUV420);
+    const EncoderSettings s = settings(800);
+    std::vector<int16_t> coefficients = coefficients_of(encode(planar, {.settings = &s}));
+    for (const uint32_t sink : {EKO_OUTPUT_MEMORY, EKO_OUTPUT_FILE, EKO_OUTPUT_STREAM})
+        for (const Mode mode : {Mode::Bands, Mode::Rows, Mode::Columns})
+            sweeps.push_back({"incremental sink " + std::to_string(sink) + " mode " + std::to_string(int(mode)),
+                              [&, sink, mode](int64_t n) {
+                                  return encode(planar, {&s, mode, sink, coefficients, [](EncoderContext*, Stage) {}, n});
+                              }, false});
+
+    int64_t points = 0;
+    for (const Sweep& sweep : sweeps) {
+        SCOPED_TRACE(sweep.what);
+        const Bytes expected = without_date(sweep.run(-1));
+        ASSERT_GT(expected.size(), 6144u);
+        for (int64_t n = 0;; ++n) {
+            SCOPED_TRACE("allocation " + std::to_string(n) + " fails");
+            NoLeak no_leak;
+            const Bytes got = sweep.run(n);
+            if (!failure_injected()) {  // fewer allocations than n: the call ran through
+                EXPECT_EQ(without_date(got), expected);
+                EXPECT_GT(n, 10);  // creation alone allocates more than ten blocks
+                break;
+            }
+            ++points;
+            EXPECT_TRUE(got.empty());
+            if (sweep.whole_image) { EXPECT_EQ(eko_GetLastError(), uint32_t(EKO_ERR_ALLOC)); }
         }
     }
+    std::cout << "[ points   ] " << points << " allocation failure points in " << sweeps.size() << " sweeps\n";
     std::remove(kPath.c_str());
 }
 
-TEST(ShortWrite, AFileThatRefusesBytesFailsTheCall) {
-    const Bytes px = noise(image_size(EKO_FORMAT_YUV420, 128, 96), 3);
-    const ImageInfo info = image_info(px.data(), 128, 96, EKO_FORMAT_YUV420);
-    const Bytes expected = encode_to_memory(info, 95);
-    const int64_t n = static_cast<int64_t>(expected.size());
-    ASSERT_GT(n, 3 * 4096);
-    for (int64_t budget : {int64_t{0}, int64_t{1}, int64_t{628}, int64_t{4095}, int64_t{4096}, int64_t{4097}, n - 1, n}) {
-        for (int by_handle = 0; by_handle < 2; ++by_handle) {
-            SCOPED_TRACE("budget " + std::to_string(budget) + (by_handle ? " by handle" : " by name"));
-            NoLeak no_leak;
-            fail_writes_after(budget);
-            eko_SetError(EKO_OK);
-            OutputRequest request{EKO_OUTPUT_FILE, by_handle ? DORVATEKO_OsFopen(kPath.c_str(), "wb") : nullptr, nullptr, 0};
-            const uint32_t r = by_handle ? eko_enc_jpeg_to_file_full_buffer(&info, &request, 95)
-                                         : eko_enc_jpeg_to_file(&info, kPath.c_str(), 95);
-            EXPECT_EQ(r, budget >= n ? 1u : 0u);
-            EXPECT_EQ(eko_GetLastError(), budget >= n ? 0u : uint32_t(EKO_ERR_WRITE));
-            if (budget >= n) { EXPECT_EQ(read_file(kPath), expected); }
+TEST(WriteFailure, AShortWriteOrAFullDiscFailsEveryFileTarget) {
+    // A stream smaller than the C library's file buffer reaches a full disc
+    // only when the file is closed; a large one already while writing.
+    const Bytes small = noise(8 * 8, 5), large = noise(image_size(EKO_FORMAT_YUV420, 128, 96), 3);
+    const ImageInfo images[] = {image_info(small.data(), 8, 8, EKO_FORMAT_GREY),
+                                image_info(large.data(), 128, 96, EKO_FORMAT_YUV420)};
+    for (const ImageInfo& info : images) {
+        const Bytes expected = encode_to_memory(info, 95);
+        const int64_t n = int64_t(expected.size());
+        for (int m = kToFile; m <= kToFileExFull; ++m) {
+            SCOPED_TRACE(member_name(m) + " " + std::to_string(n) + " bytes");
+            {
+                NoLeak no_leak;
+                const Call c = call_member(m, info, 95, "/dev/full");
+                EXPECT_TRUE(c.result == 0 && eko_GetLastError() == EKO_ERR_WRITE);
+            }
+            // The file takes `budget` bytes, then every write comes up short.
+            for (int64_t budget : {int64_t{0}, int64_t{1}, int64_t{628}, int64_t{4095}, int64_t{4096}, n - 1, n}) {
+                NoLeak no_leak;
+                fail_writes_after(budget);
+                const Call c = call_member(m, info, 95, kPath);
+                EXPECT_EQ(c.result, budget >= n ? 1u : 0u) << budget;
+                EXPECT_EQ(eko_GetLastError(), budget >= n ? 0u : uint32_t(EKO_ERR_WRITE)) << budget;
+                if (budget >= n) { EXPECT_EQ(c.out, expected); }
+            }
+        }
+        // The MCU-row interface writes into the caller's open file and the
+        // caller closes it: a large stream fails while coding and hands back
+        // nothing; a small one fails only at the caller's close.
+        SCOPED_TRACE("MCU rows " + std::to_string(n) + " bytes");
+        NoLeak no_leak;
+        void* file = DORVATEKO_OsFopen("/dev/full", "wb");
+        const OutputRequest request{EKO_OUTPUT_FILE, file, nullptr, 0};
+        const EncodeOptions options{95, nullptr, 0};
+        EncoderContext* ctx = eko_jpeg_enc_mcu_init(&info, &request, &options, nullptr);
+        ASSERT_NE(ctx, nullptr);
+        const bool is_small = info.width == 8;
+        Bytes band(size_t(info.width) * 32, 0x80);
+        uint32_t next = 0, coded = 0;
+        for (int row = 0; row < info.height; row += info.format == EKO_FORMAT_GREY ? 8 : 16) {
+            std::copy_n(static_cast<const uint8_t*>(info.data) + size_t(row) * info.width,
+                        size_t(info.width) * (is_small ? 8 : 16), band.begin());
+            coded += eko_jpeg_enc_muc_process(ctx, band.data(), &next);
+        }
+        uint8_t* buffer = &band[0];
+        uint32_t length = 7;
+        eko_jpeg_enc_mcu_finish(ctx, &buffer, &length);
+        const uint32_t finish_error = eko_GetLastError();
+        const int closed = DORVATEKO_OsFclose(file);
+        if (is_small) {
+            EXPECT_TRUE(coded == 1 && length == n && finish_error == EKO_OK && closed != 0);
+        } else {
+            EXPECT_TRUE(coded < 6 && buffer == nullptr && length == 0 && finish_error == EKO_ERR_WRITE);
         }
     }
     std::remove(kPath.c_str());

@@ -30,9 +30,9 @@ uint32_t ignore(void*, const uint8_t*, uint32_t) { return 1; }
 void expect_refused(const std::function<uint32_t()>& call, uint32_t error) {
     const int64_t live = live_blocks();
     const size_t fds = open_descriptors();
-    eko_SetError(EKO_OK);
+    eko_SetError(99);  // a stale reason the refusal must replace with its own
     EXPECT_EQ(call(), 0u);
-    if (error != EKO_OK) { EXPECT_EQ(eko_GetLastError(), error); }
+    EXPECT_EQ(eko_GetLastError(), error);
     EXPECT_EQ(live_blocks(), live);
     EXPECT_EQ(open_descriptors(), fds);
 }
@@ -65,17 +65,16 @@ EncoderSettings settings_420() {
 uint8_t g_mark;
 
 // eko_enc_jpeg_to_buffer (or _ex) on the caller's variables holding a block of
-// `length` bytes (a mark if not positive): afterwards null and 0 when
-// `expect_null` (the block still the caller's), otherwise unchanged.
-std::function<uint32_t()> on_block(bool ex, const ImageInfo* info, const EncodeOptions* options, int32_t length,
-                                   bool expect_null) {
+// `length` bytes (a mark if not positive): a refused call leaves both as they
+// were, and the block the caller's.
+std::function<uint32_t()> on_block(bool ex, const ImageInfo* info, const EncodeOptions* options, int32_t length) {
     return [=] {
         uint8_t* const block = length > 0 ? static_cast<uint8_t*>(DORVATEKO_OsMalloc(length)) : &g_mark;
         uint8_t* buffer = block;
         int32_t len = length;
         const uint32_t r = ex ? eko_enc_jpeg_to_buffer_ex(info, &buffer, &len, options)
                               : eko_enc_jpeg_to_buffer(info, &buffer, &len, 75);
-        EXPECT_TRUE(buffer == (expect_null ? nullptr : block) && len == (expect_null ? 0 : length));
+        EXPECT_TRUE(buffer == block && len == length);
         if (block != &g_mark) DORVATEKO_OsFree(block);
         return r;
     };
@@ -99,29 +98,45 @@ TEST(Misuse, NullArgumentsAndUnusableTargetsAreRefused) {
     uint8_t* buffer = nullptr;
     const struct { const char* what; std::function<uint32_t()> call; uint32_t error; } rows[] = {
         {"file, null image", [&] { return eko_enc_jpeg_to_file(nullptr, name.c_str(), 75); }, EKO_ERR_ARGUMENT},
-        {"file, null name", [&] { return eko_enc_jpeg_to_file(&good, nullptr, 75); }, EKO_OK},
+        {"file, null name", [&] { return eko_enc_jpeg_to_file(&good, nullptr, 75); }, EKO_ERR_ARGUMENT},
         {"file_ex, null options", [&] { return eko_enc_jpeg_to_file_ex(&good, name.c_str(), nullptr); }, EKO_ERR_ARGUMENT},
-        {"file_ex, unopenable path", [&] { return eko_enc_jpeg_to_file_ex(&good, "/nonexistent/x.jpg", &opts); }, EKO_OK},
-        {"buffer, null buffer variable", [&] { return eko_enc_jpeg_to_buffer(&good, nullptr, &length, 75); }, EKO_OK},
-        {"buffer, null length variable", [&] { return eko_enc_jpeg_to_buffer(&good, &buffer, nullptr, 75); }, EKO_OK},
-        {"buffer, negative length", on_block(false, &good, &opts, -1, false), EKO_OK},
-        {"buffer_ex, negative length", on_block(true, &good, &opts, -4096, true), EKO_OK},
-        {"buffer, null image", on_block(false, nullptr, &opts, 4096, true), EKO_OK},
-        {"buffer_ex, null options", on_block(true, &good, nullptr, 4096, true), EKO_ERR_ARGUMENT},
-        {"buffer full buffer, null request", [&] { return eko_enc_jpeg_to_buffer_full_buffer(&good, nullptr, 75); }, EKO_OK},
+        {"file_ex, unopenable path", [&] { return eko_enc_jpeg_to_file_ex(&good, "/nonexistent/x.jpg", &opts); }, EKO_ERR_OPEN},
+        {"file full buffer, no handle", [&] { OutputRequest r{}; return eko_enc_jpeg_to_file_full_buffer(&good, &r, 75); }, EKO_ERR_ARGUMENT},
+        {"buffer, null buffer variable", [&] { return eko_enc_jpeg_to_buffer(&good, nullptr, &length, 75); }, EKO_ERR_ARGUMENT},
+        {"buffer, null length variable", [&] { return eko_enc_jpeg_to_buffer(&good, &buffer, nullptr, 75); }, EKO_ERR_ARGUMENT},
+        {"buffer, negative length", on_block(false, &good, &opts, -1), EKO_ERR_ARGUMENT},
+        {"buffer_ex, negative length", on_block(true, &good, &opts, -4096), EKO_ERR_ARGUMENT},
+        {"buffer, null image", on_block(false, nullptr, &opts, 100), EKO_ERR_ARGUMENT},
+        {"buffer_ex, null options", on_block(true, &good, nullptr, 4096), EKO_ERR_ARGUMENT},
+        {"buffer full buffer, null request", [&] { return eko_enc_jpeg_to_buffer_full_buffer(&good, nullptr, 75); }, EKO_ERR_ARGUMENT},
         {"buffer full buffer, null options leave the request alone (a change counts as success)", [&] {
              OutputRequest r{7, nullptr, &g_mark, 12345};
              return eko_enc_jpeg_to_buffer_ex_full_buffer(&good, &r, nullptr) + (r.buffer != &g_mark || r.capacity != 12345);
          }, EKO_ERR_ARGUMENT},
-        {"stream, null callback", [&] { return eko_enc_jpeg_to_stream(&good, nullptr, 75, &arg); }, EKO_OK},
-        {"stream, null callback argument", [&] { return eko_enc_jpeg_to_stream(&good, ignore, 75, nullptr); }, EKO_OK},
+        {"stream, null callback", [&] { return eko_enc_jpeg_to_stream(&good, nullptr, 75, &arg); }, EKO_ERR_ARGUMENT},
+        {"stream, null callback argument", [&] { return eko_enc_jpeg_to_stream(&good, ignore, 75, nullptr); }, EKO_ERR_ARGUMENT},
         {"stream_ex, null options", [&] { return eko_enc_jpeg_to_stream_ex(&good, ignore, nullptr, &arg); }, EKO_ERR_ARGUMENT},
+        {"EXIF block into no buffer", [&] { ExifInfo e{}; return __eko_CreateExif(nullptr, &e); }, EKO_ERR_ARGUMENT},
     };
     for (const auto& row : rows) {
         SCOPED_TRACE(row.what);
         expect_refused(row.call, row.error);
     }
-    std::remove(name.c_str());
+    // Null pixels, in every layout, through every member: refused before a
+    // file is opened or the caller's block touched.
+    for (uint32_t format : {0u, 1u, 2u, 4u, 7u, 8u}) {
+        const ImageInfo no_pixels = image_info(nullptr, 32, 24, format);
+        for (int m = 0; m < kMembers; ++m) {
+            SCOPED_TRACE(member_name(m) + " format " + std::to_string(format));
+            expect_refused([&] {
+                const Call c = call_member(m, no_pixels, 75, name, 100);
+                EXPECT_TRUE(c.kept);
+                return c.result;
+            }, EKO_ERR_ARGUMENT);
+            if (m != kToFileFull && m != kToFileExFull) { EXPECT_FALSE(file_exists(name)); }  // those open it themselves
+            std::remove(name.c_str());
+        }
+    }
     uint8_t block[4096];
     for (uint32_t kind : {2u, 3u, 5u, 8u, 0xFFFFFFFFu}) {  // creation refuses other output kinds
         const OutputRequest request{kind, nullptr, block, sizeof block};
@@ -140,7 +155,7 @@ TEST(Misuse, BadFormatsAndDimensionsAreRefusedByEveryOutputKind) {
     for (const auto& d : bad) {
         const ImageInfo info = image_info(px.data(), d.w, d.h, d.format);
         SCOPED_TRACE("format " + std::to_string(d.format) + " " + std::to_string(d.w) + "x" + std::to_string(d.h));
-        expect_refused(on_block(true, &info, &options, 4096, true), d.error);  // the block is not freed
+        expect_refused(on_block(true, &info, &options, 4096), d.error);  // the block is still the caller's
         OutputRequest memory{EKO_OUTPUT_MEMORY, nullptr, nullptr, 0};
         expect_refused([&] { return eko_enc_jpeg_to_buffer_full_buffer(&info, &memory, 75); }, d.error);
         expect_refused([&] { return eko_enc_jpeg_to_stream(&info, ignore, 75, &memory); }, d.error);
@@ -171,6 +186,10 @@ TEST(Creation, RefusesSettingsThatTheGeometryCannotServe) {
         {"no component", EKO_FORMAT_YUV420, [](EncoderSettings& s) { s.num_components = 0; }},
         {"two components", EKO_FORMAT_YUV420, [](EncoderSettings& s) { s.num_components = 2; }},
         {"horizontal factor 0", EKO_FORMAT_YUV420, [](EncoderSettings& s) { s.component_specs[1][1] = 0; }},
+        {"vertical factor 0", EKO_FORMAT_YUV420, [](EncoderSettings& s) { s.component_specs[2][2] = 0; }},
+        // Its header carries table 0 alone: a frame naming table 1 would not decode.
+        {"one component naming table 1 of 2", EKO_FORMAT_YUV420,
+         [](EncoderSettings& s) { s.num_components = 1, s.component_specs[0][0] = 1; }},
         {"factor 3", EKO_FORMAT_YUV420, [](EncoderSettings& s) { s.component_specs[0][1] = 3; }},
         {"12 blocks per MCU", EKO_FORMAT_YUV420,
          [](EncoderSettings& s) { for (int c : {1, 2}) s.component_specs[c][1] = s.component_specs[c][2] = 2; }},
@@ -236,4 +255,65 @@ TEST(Creation, PlaneOffsetsOfTheLargestImageDoNotOverflow) {
     DORVATEKO_OsFree(ctx->work_buffer);
     __eko_jpeg_enc_release_mem(ctx);
     DORVATEKO_OsFree(ctx);
+}
+
+TEST(ErrorCode, EveryCallThatSucceedsReportsNoError) {
+    // The reason always belongs to the last call: a success after a failure
+    // reads 0, not the failure's code.
+    const auto fresh = [](const std::string& what, bool succeeded) {
+        EXPECT_TRUE(succeeded && eko_GetLastError() == EKO_OK) << what;
+        eko_SetError(EKO_ERR_STATE);  // stale for the next call
+    };
+    const Bytes yuv = rgb_to_yuv420(photo_rgb(32, 32), 32, 32);
+    const ImageInfo info = image_info(yuv.data(), 32, 32, EKO_FORMAT_YUV420);
+    const std::string path = temp_path("fresh.jpg");
+    eko_SetError(EKO_ERR_STATE);
+    for (int m = 0; m < kMembers; ++m) fresh(member_name(m), call_member(m, info, 75, path).result == 1);
+    std::remove(path.c_str());
+    // Incremental: a band, a row of coefficients, columns and the join.
+    const EncoderSettings s = settings_420();
+    const EncodeOptions options{75, nullptr, 0};
+    std::vector<int16_t> zero(12 * 64, 0);
+    McuBlockList mcus[2];
+    for (int k = 0; k < 12; ++k) mcus[k / 6].blocks[k % 6] = &zero[64 * k];
+    uint8_t* block = nullptr;
+    uint32_t length = 0, next = 0;
+    for (const bool columns : {false, true}) {
+        const OutputRequest request{EKO_OUTPUT_MEMORY, nullptr, nullptr, 0};
+        EncoderContext* ctx = eko_jpeg_enc_mcu_init(&info, &request, &options, &s);
+        fresh("init", ctx != nullptr);
+        fresh("get_encdata", eko_jpeg_enc_mcu__get_encdata(ctx, &block, &length) != nullptr);
+        if (columns) {
+            fresh("column set-up", __eko_jpeg_enc_col_encoder_init(ctx) == 1);
+            McuBlockList column[2] = {mcus[0], mcus[1]};
+            for (int k = 0; k < 2; ++k) fresh("column", __eko_jpeg_enc_col_entroy_encoder(ctx, column, &next) == 1);
+            fresh("join", __eko_jpeg_enc_col_encoder_finish(ctx) == 1);
+        } else {
+            fresh("band", eko_jpeg_enc_muc_process(ctx, yuv.data(), &next) == 1);
+            fresh("row driver", __eko_jpeg_enc_entroy_encoder(ctx, mcus, &next) == 1);
+        }
+        eko_jpeg_enc_mcu_finish(ctx, &block, &length);
+        fresh("finish", block != nullptr);
+        DORVATEKO_OsFree(block);
+    }
+    const OutputRequest to_stream{EKO_OUTPUT_STREAM, nullptr, nullptr, 0};
+    EncoderContext* ctx = eko_jpeg_enc_mcu_init(&info, &to_stream, &options, nullptr);
+    fresh("set_stream", eko_jpeg_enc_mcu_set_stream(ctx, ignore, nullptr) == 1);
+    eko_jpeg_enc_mcu_finish(ctx, nullptr, nullptr);
+    // Conversions, the packed reader and the EXIF builder.
+    std::vector<uint16_t> rgb565(32 * 32);
+    fresh("RGB565", eko_DuoYUV420toRGB565(yuv.data(), 32, 32, rgb565.data()) == 1);
+    fresh("RGB565 from V/U", eko_DuoPYV0420toRGB565(yuv.data(), 32, 32, rgb565.data()) == 1);
+    Bytes scaled(16 * 8 * 3 / 2);
+    __eko_jpeg_enc_down_scale_yuv422(yuv.data(), 16, 16, 16, scaled.data(), 16, 8);
+    fresh("down-scaler", true);
+    const OutputRequest to_memory{EKO_OUTPUT_MEMORY, nullptr, nullptr, 0};
+    ctx = __eko_jpeg_enc_initiaize(&info, &to_memory, &options, nullptr);
+    fresh("creation", ctx != nullptr);
+    fresh("packed 4:2:2 reader", __eko_jpeg_enc_get_raw_duoview422_data(ctx) == 1);
+    __eko_jpeg_enc_release_mem(ctx);
+    DORVATEKO_OsFree(ctx);
+    uint8_t tiff[64];
+    const ExifInfo none{};
+    fresh("EXIF block", __eko_CreateExif(tiff, &none) == 44);
 }

@@ -35,12 +35,15 @@ TEST(DisplayConvert, TablesSinglePixelsAndRefusals) {
         EXPECT_EQ(convert(f, {128, 128, 128}, 1, 1), Words{0x83F0});  // 129, 127, 130
         EXPECT_EQ(convert(f, {255, 255, 255}, 1, 1), Words{0xFBDF});  // 255, 120, 255
         EXPECT_EQ(convert(f, {0, 0, 0}, 1, 1), Words{0x0420});        // 0, 134, 0
-        // Null buffers and empty or negative sizes are refused untouched.
+        // Null buffers and empty or negative sizes are refused untouched, each
+        // with its reason.
         const Bytes src(4 * 4 * 3 / 2, 90);
         Words dst(16, 0x1234);
-        EXPECT_EQ(f(nullptr, 4, 4, dst.data()) | f(src.data(), 4, 4, nullptr), 0u);
-        EXPECT_EQ(f(src.data(), 0, 4, dst.data()) | f(src.data(), 4, 0, dst.data()), 0u);
-        EXPECT_EQ(f(src.data(), -4, 4, dst.data()) | f(src.data(), 4, -1, dst.data()), 0u);
+        const struct { const uint8_t* s; int w, h; uint16_t* d; uint32_t error; } refused[] = {
+            {nullptr, 4, 4, dst.data(), EKO_ERR_ARGUMENT}, {src.data(), 4, 4, nullptr, EKO_ERR_ARGUMENT},
+            {src.data(), 0, 4, dst.data(), EKO_ERR_DIMENSIONS}, {src.data(), 4, 0, dst.data(), EKO_ERR_DIMENSIONS},
+            {src.data(), -4, 4, dst.data(), EKO_ERR_DIMENSIONS}, {src.data(), 4, -1, dst.data(), EKO_ERR_DIMENSIONS}};
+        for (const auto& r : refused) EXPECT_TRUE(f(r.s, r.w, r.h, r.d) == 0 && eko_GetLastError() == r.error) << r.w;
         EXPECT_EQ(dst, Words(16, 0x1234));
     }
 }

@@ -1,4 +1,5 @@
 #include "incremental/incremental_support.h"
+#include "support/fault_os_layer.h"
 
 #include <algorithm>
 #include <cstdio>
@@ -18,10 +19,12 @@ Bytes encode(const ImageInfo& info, Job job) {
     auto* buffer = static_cast<uint8_t*>(job.sink == EKO_OUTPUT_MEMORY ? DORVATEKO_OsMalloc(2048) : nullptr);
     const OutputRequest request{job.sink, file, buffer, buffer != nullptr ? 2048u : 0u};
     const EncodeOptions options{75, nullptr, 0};
+    if (job.fail_at >= 0) fail_allocation(job.fail_at);
     EncoderContext* ctx = eko_jpeg_enc_mcu_init(&info, &request, &options, job.settings);
     Bytes out;
     uint32_t length = 0, next = 0;
     bool ok = ctx != nullptr;
+    if (!ok && job.fail_at >= 0) fail_allocation(-1);
     if (!ok) DORVATEKO_OsFree(buffer);  // refused, still ours
     if (ok) {
         job.hook(ctx, Stage::Created);
@@ -64,6 +67,7 @@ Bytes encode(const ImageInfo& info, Job job) {
         if (columns) job.hook(ctx, Stage::Joined);
         job.hook(ctx, Stage::Coded);
         eko_jpeg_enc_mcu_finish(ctx, &buffer, &length);  // no block for a file or stream
+        if (job.fail_at >= 0) fail_allocation(-1);
         if (buffer != nullptr) out.assign(buffer, buffer + length);
         DORVATEKO_OsFree(buffer);
     }

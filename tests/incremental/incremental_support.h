@@ -21,6 +21,7 @@ struct Job {
     uint32_t sink = EKO_OUTPUT_MEMORY;
     std::vector<int16_t> coefficients;  // empty: those of the band-by-band stream
     std::function<void(EncoderContext*, Stage)> hook = [](EncoderContext*, Stage) {};
+    int64_t fail_at = -1;  // >= 0: that allocation of the library's calls fails
 };
 
 // A whole encode; planar bands are cut from info.data. Empty when a call

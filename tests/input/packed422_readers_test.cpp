@@ -87,8 +87,9 @@ TEST(Packed422Reader, DefinedExamplesEdgesAndUnfitContexts) {
     // Contexts that cannot take the rows are refused untouched: 4:2:2 rows
     // would need 16 chroma rows of 8.
     PackedContext f420(ramp.data(), 8, 16, false);
-    EXPECT_EQ(__eko_jpeg_enc_get_raw_duoview422_data(nullptr), 0u);
-    EXPECT_EQ(__eko_jpeg_enc_get_raw_duoview422_data_for_yuv422(f420.ctx), 0u);
+    EXPECT_TRUE(__eko_jpeg_enc_get_raw_duoview422_data(nullptr) == 0 && eko_GetLastError() == EKO_ERR_ARGUMENT);
+    EXPECT_TRUE(__eko_jpeg_enc_get_raw_duoview422_data_for_yuv422(f420.ctx) == 0 &&
+                eko_GetLastError() == EKO_ERR_SAMPLING);
     EXPECT_TRUE(f420.ctx->read_ptr == ramp.data() && f420.cells(1, 0) == Bytes(8, 0xEE));
 }
 

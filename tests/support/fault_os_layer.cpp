@@ -12,24 +12,31 @@ std::atomic<int64_t> fail_at{-1};
 std::atomic<int64_t> allocations{0};
 std::atomic<int64_t> live{0};
 std::atomic<int64_t> write_budget{-1};
+std::atomic<bool> injected{false};
 
 bool should_fail() {
     ++allocations;
     int64_t n = fail_at.load();
     if (n < 0) return false;
     fail_at.store(n - 1);
+    if (n == 0) injected.store(true);
     return n == 0;
 }
 }  // namespace
 
 namespace tekoj_test {
-void fail_allocation(int64_t n) { fail_at.store(n); }
+void fail_allocation(int64_t n) {
+    fail_at.store(n);
+    if (n >= 0) injected.store(false);
+}
+bool failure_injected() { return injected.load(); }
 int64_t allocation_count() { return allocations.load(); }
 int64_t live_blocks() { return live.load(); }
 void reset_counters() {
     allocations.store(0);
     fail_at.store(-1);
     write_budget.store(-1);
+    injected.store(false);
 }
 void fail_writes_after(int64_t bytes) { write_budget.store(bytes); }
 }  // namespace tekoj_test

@@ -8,6 +8,8 @@ namespace tekoj_test {
 
 // The n-th allocation from now (0 = the next one) fails; -1 switches it off.
 void fail_allocation(int64_t n);
+// Whether an allocation was made to fail since the last reset or arming.
+bool failure_injected();
 // Allocations and releases since the last reset, and blocks still live.
 int64_t allocation_count();
 int64_t live_blocks();

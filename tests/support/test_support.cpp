@@ -1,9 +1,14 @@
 #include "support/test_support.h"
+#include "support/fault_os_layer.h"
 
 #include <turbojpeg.h>
 
+#include <gtest/gtest.h>
+
+#include <algorithm>
 #include <cmath>
 #include <cstdio>
+#include <filesystem>
 #include <fstream>
 #include <iterator>
 #include <unistd.h>
@@ -179,6 +184,61 @@ Bytes encode_to_memory(const ImageInfo& info, uint32_t quality) {
     Bytes out(block, block + length);
     DORVATEKO_OsFree(block);
     return out;
+}
+
+std::string member_name(int m) {
+    static const char* const names[kMembers] = {
+        "to_file", "to_file_ex", "to_file_full_buffer", "to_file_ex_full_buffer", "to_buffer", "to_buffer_ex",
+        "to_buffer_full_buffer", "to_buffer_ex_full_buffer", "to_stream", "to_stream_ex"};
+    return m >= 0 && m < kMembers ? names[m] : "?";
+}
+
+Call call_member(int m, const ImageInfo& info, uint32_t quality, const std::string& path, int32_t start,
+                 int64_t fail_at) {
+    Call c;
+    const EncodeOptions options{quality, nullptr, 0};
+    if (!is_memory_member(m)) start = 0;
+    uint8_t* const block = start > 0 ? static_cast<uint8_t*>(DORVATEKO_OsMalloc(uint32_t(start))) : nullptr;
+    uint8_t* buffer = block;
+    int32_t length = start;
+    OutputRequest request{99, nullptr, block, uint32_t(start)};  // the members set the kind themselves
+    if (m == kToFileFull || m == kToFileExFull) request.file = DORVATEKO_OsFopen(path.c_str(), "wb");
+    // The callback's result must not matter: 0 says "refused".
+    const EkoStreamCallback sink = [](void* arg, const uint8_t* data, uint32_t n) -> uint32_t {
+        auto* to = static_cast<Call*>(arg);
+        to->out.insert(to->out.end(), data, data + n);
+        to->largest_piece = std::max(to->largest_piece, n);
+        return 0;
+    };
+    if (fail_at >= 0) fail_allocation(fail_at);
+    switch (m) {
+        case kToFile: c.result = eko_enc_jpeg_to_file(&info, path.c_str(), quality); break;
+        case kToFileEx: c.result = eko_enc_jpeg_to_file_ex(&info, path.c_str(), &options); break;
+        case kToFileFull: c.result = eko_enc_jpeg_to_file_full_buffer(&info, &request, quality); break;
+        case kToFileExFull: c.result = eko_enc_jpeg_to_file_ex_full_buffer(&info, &request, &options); break;
+        case kToBuffer: c.result = eko_enc_jpeg_to_buffer(&info, &buffer, &length, quality); break;
+        case kToBufferEx: c.result = eko_enc_jpeg_to_buffer_ex(&info, &buffer, &length, &options); break;
+        case kToBufferFull: c.result = eko_enc_jpeg_to_buffer_full_buffer(&info, &request, quality); break;
+        case kToBufferExFull: c.result = eko_enc_jpeg_to_buffer_ex_full_buffer(&info, &request, &options); break;
+        case kToStream: c.result = eko_enc_jpeg_to_stream(&info, sink, quality, &c); break;
+        default: c.result = eko_enc_jpeg_to_stream_ex(&info, sink, &options, &c);
+    }
+    if (fail_at >= 0) fail_allocation(-1);
+    if (m == kToBufferFull || m == kToBufferExFull) buffer = request.buffer, length = int32_t(request.capacity);
+    if (is_memory_member(m)) {
+        c.kept = buffer == block && length == start;
+        if (c.result == 1) c.out.assign(buffer, buffer + length);
+        // eko_enc_jpeg_to_buffer enlarges a short block before anything else.
+        const bool enlarged = m == kToBuffer && start < 2048 && buffer != nullptr && length == 2048;
+        if (c.result == 0) { EXPECT_TRUE(c.kept || enlarged || (buffer == nullptr && length == 0)) << member_name(m); }
+        DORVATEKO_OsFree(buffer);
+    } else if (is_file_member(m)) {
+        c.out.clear();
+        if (c.result == 1 && std::filesystem::is_regular_file(path)) c.out = read_file(path);
+    } else if (c.result == 0) {
+        c.out.clear();
+    }
+    return c;
 }
 
 Bytes read_file(const std::string& path) {

@@ -42,6 +42,32 @@ size_t image_size(uint32_t format, int width, int height);
 Bytes encode_to_memory(const ImageInfo& info, uint32_t quality);
 ImageInfo image_info(const void* data, int width, int height, uint32_t format);
 
+// The ten whole-image members, by output kind.
+enum Member {
+    kToFile, kToFileEx, kToFileFull, kToFileExFull,          // file: by name, by handle
+    kToBuffer, kToBufferEx, kToBufferFull, kToBufferExFull,  // memory block
+    kToStream, kToStreamEx,                                  // callback
+    kMembers
+};
+inline bool is_file_member(int m) { return m <= kToFileExFull; }
+inline bool is_memory_member(int m) { return m >= kToBuffer && m <= kToBufferExFull; }
+std::string member_name(int m);
+
+struct Call {
+    uint32_t result = 0;
+    Bytes out;                  // the stream: file contents, block or callback pieces in order
+    uint32_t largest_piece = 0; // callback members
+    bool kept = true;           // memory members: the caller's block and length are as they were
+};
+// One call of member `m` as a caller following the header makes it: file
+// members write to `path` (by name, or a handle opened on it), memory members
+// start from a block of `start` bytes (none for 0). After a 0 result the
+// caller's variables must hold its own block unchanged, or null and 0 (the
+// library freed the block); checked here. Frees whatever the caller owns.
+// With `fail_at` >= 0 that allocation of the member call itself fails.
+Call call_member(int m, const ImageInfo& info, uint32_t quality, const std::string& path, int32_t start = 0,
+                 int64_t fail_at = -1);
+
 // Files.
 Bytes read_file(const std::string& path);
 bool file_exists(const std::string& path);
