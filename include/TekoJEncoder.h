@@ -409,6 +409,58 @@ EKO_API void eko_jpeg_enc_mcu_finish(EncoderContext* context, uint8_t** buffer_o
 EKO_API uint32_t eko_jpeg_enc_mcu_set_stream(EncoderContext* context, EkoStreamCallback callback,
                                              void* callback_arg);
 
+/* ------------------------------------------------------------------------ */
+/* Row-parallel encoding                                                     */
+/* ------------------------------------------------------------------------ */
+
+/* One image coded by several of the caller's threads at once, into exactly
+ * the stream that the whole-image entry points produce. Every MCU row is a
+ * restart interval of its own, so rows are coded apart, each by one worker
+ * into a row buffer of its own, and handed on in image order: a file or
+ * stream target receives each row as soon as every earlier row is done, a
+ * memory target gets each row appended once. The library starts no thread;
+ * the caller's threads call eko_enc_jpeg_parallel_rows, each with its own
+ * worker number.
+ *
+ * create: image_info (EXIF included; the band words are ignored), output
+ *   (kind 0 with an open file, which the caller closes after finish; kind 1
+ *   with a block from DORVATEKO_OsMalloc, which belongs to the encode until
+ *   finish; kind 4 with `callback`, which then gets the stream in pieces of
+ *   at most 4096 bytes, called from whichever worker thread hands rows on,
+ *   one call at a time), options, settings (null, or an EncoderSettings
+ *   record as for eko_jpeg_enc_mcu_init: with write_dri 0 the rows cannot be
+ *   coded apart and are coded one after another in row order) and the number
+ *   of workers, 1 to 64. All working memory is allocated here: each worker's
+ *   sample rows and coefficient blocks, and a window of row buffers (two per
+ *   worker, more for short rows); memory does not grow with the image
+ *   height. Null on failure (the caller's block then still the caller's).
+ * row_count: the number of MCU rows (16 image rows each for 4:2:0, 8 for
+ *   grey), numbered from 0; 0 for a null encode.
+ * rows: worker `worker` codes rows first_row .. first_row + row_count - 1.
+ *   Calls with different workers may run at the same time; one worker is
+ *   used by one call at a time (error 23 otherwise). A row more than a
+ *   window ahead of the first row not yet handed on waits until it is, so
+ *   hand the rows out in rising order (say, each thread taking the next row
+ *   from a shared counter): a row waits only for rows that other calls have
+ *   taken. Any failure (an allocation, a write, a row coded twice) fails the
+ *   whole encode; every call then returns 0 as soon as it can.
+ * finish: once every rows call has returned. Appends EOI after the last
+ *   row, hands the memory stream over through buffer_out and length_out
+ *   (null and 0 after a failure, the block then freed; both may be null for
+ *   kinds 0 and 4) and frees the encode. Returns 1 when every row was coded
+ *   and the stream is complete. */
+typedef struct EkoParallelEncode EkoParallelEncode;
+
+EKO_API EkoParallelEncode* eko_enc_jpeg_parallel_create(const ImageInfo* image_info, const OutputRequest* output,
+                                                        const EncodeOptions* options,
+                                                        const EncoderSettings* settings, EkoStreamCallback callback,
+                                                        void* callback_arg, uint32_t workers);
+EKO_API uint32_t eko_enc_jpeg_parallel_row_count(const EkoParallelEncode* encode);
+EKO_API uint32_t eko_enc_jpeg_parallel_rows(EkoParallelEncode* encode, uint32_t worker, uint32_t first_row,
+                                            uint32_t row_count);
+EKO_API uint32_t eko_enc_jpeg_parallel_finish(EkoParallelEncode* encode, uint8_t** buffer_out,
+                                              uint32_t* length_out);
+
 /* Row entropy drivers and column-split mode. */
 EKO_API uint32_t __eko_jpeg_enc_entroy_encoder(EncoderContext* context, McuBlockList* mcus,
                                                uint32_t* next_row_out);

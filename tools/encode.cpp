@@ -5,7 +5,7 @@
 // How each input reaches the library:
 //   RGB, 4:2:0        RGB888 reader, pointed at each band of rows
 //   RGB, 4:2:2        converted here to a planar 4:2:2 band (band call)
-//   RGB, 4:4:4        converted here to three full planes, planar reader
+//   RGB, 4:4:4        converted here to three full planes, planar reader run here
 //   grey (any input)  one plane per band (band call)
 //   I420              planes copied into the band call's buffer
 //   NV21, NV12        the interleaved V/U reader, reading the frame in place
@@ -186,6 +186,8 @@ Summary encode(Source& src, const Options& o, Output& out, const std::function<v
     } else if (layout == Layout::Rgb && sampling == 420) {
         format = EKO_FORMAT_RGB888;
     } else if (sampling == 444) {
+        // Full-width chroma rows do not fit the band call's buffer; the
+        // planar reader takes three separate planes instead.
         reader = __eko_jpeg_enc_get_raw_data;
     } else if (layout == Layout::Nv21 || layout == Layout::Nv12) {
         reader = __eko_jpeg_enc_get_raw_pvu_data;
@@ -233,16 +235,7 @@ Summary encode(Source& src, const Options& o, Output& out, const std::function<v
     options.quality = o.quality;
     const EncoderSettings settings = sampling_settings(sampling, o.quality);
     const bool with_settings = !summary.grey && sampling != 420;
-    EncoderContext* ctx = nullptr;
-    if (sampling == 444) {
-        // Full-width chroma rows do not fit the band call's buffer, which the
-        // MCU-row init checks for; the planar reader takes three separate
-        // planes here instead, so the context is made and headed directly.
-        ctx = __eko_jpeg_enc_initiaize(&image, &request, &options, &settings);
-        if (ctx != nullptr) __eko_jpeg_enc_make_header(ctx);
-    } else {
-        ctx = eko_jpeg_enc_mcu_init(&image, &request, &options, with_settings ? &settings : nullptr);
-    }
+    EncoderContext* ctx = eko_jpeg_enc_mcu_init(&image, &request, &options, with_settings ? &settings : nullptr);
     if (ctx == nullptr) fail(library_error("the encoder refused the image"));
     Encoder enc(ctx, state);
     if (eko_jpeg_enc_mcu_set_stream(ctx, on_stream, &state) == 0) fail(library_error("cannot start the stream"));

@@ -5,7 +5,7 @@
 #include "tool.h"
 
 // The tool also drives exported internal steps: the readers that no format
-// code selects, and creation for planar 4:4:4.
+// code selects, and the coding pass that follows them.
 #if __has_include(<TekoJEncoderInternal.h>)
 #include <TekoJEncoderInternal.h>
 #else

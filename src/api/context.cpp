@@ -48,6 +48,25 @@ bool settings_usable(const EncoderContext* ctx) {
 
 }  // namespace
 
+bool allocate_band_rows(EncoderContext* ctx) {
+    for (uint32_t c = 0; c < ctx->num_components && c < 3; ++c) {
+        const ComponentInfo& comp = ctx->comp_info[c];
+        const uint32_t row_length = comp.width_in_blocks * ctx->max_h_samp * 8u / comp.h_samp_factor;
+        ctx->sample_rows->row_arrays[c] = __eko_jpeg_enc_alloc_sample_arry(ctx, row_length, comp.band_rows);
+        if (ctx->sample_rows->row_arrays[c] == nullptr) return false;
+    }
+    return true;
+}
+
+void release_band_rows(EncoderContext* ctx) {
+    for (uint32_t c = 0; c < ctx->num_components && c < 3; ++c) {
+        // The row array and its rows are one block.
+        uint8_t** rows = ctx->sample_rows->row_arrays[c];
+        if (rows != nullptr) DORVATEKO_OsFree(rows);
+        ctx->sample_rows->row_arrays[c] = nullptr;
+    }
+}
+
 void discard_context(EncoderContext* ctx) {
     if (ctx->work_buffer != nullptr) DORVATEKO_OsFree(ctx->work_buffer);
     ctx->work_buffer = nullptr;
@@ -234,10 +253,8 @@ EKO_API uint32_t __eko_jpeg_enc_initail_setup(EncoderContext* context) {
         comp->downsampled_width = static_cast<uint32_t>((ctx->width * h + ctx->max_h_samp - 1) / ctx->max_h_samp);
         comp->downsampled_height = static_cast<uint32_t>((ctx->height * v + ctx->max_v_samp - 1) / ctx->max_v_samp);
         comp->band_rows = comp->rows_this_band = static_cast<uint32_t>(v) * 8;
-        const uint32_t row_length = comp->width_in_blocks * ctx->max_h_samp * 8u / static_cast<uint32_t>(h);
-        ctx->sample_rows->row_arrays[c] = __eko_jpeg_enc_alloc_sample_arry(ctx, row_length, comp->band_rows);
-        if (ctx->sample_rows->row_arrays[c] == nullptr) return 0;
     }
+    if (!tekoj::allocate_band_rows(ctx)) return 0;
     ctx->total_imcu_rows = static_cast<uint32_t>((ctx->height + mv - 1) / mv);
 
     if (__eko_jpeg_enc_prepare_huffman_code(ctx) != 1) return 0;
@@ -260,10 +277,7 @@ EKO_API void __eko_jpeg_enc_release_mem(EncoderContext* context) {
         if (p != nullptr) DORVATEKO_OsFree(p);
     };
     if (ctx->sample_rows != nullptr) {
-        for (uint32_t c = 0; c < ctx->num_components && c < 3; ++c) {
-            // The row array and its rows are one block.
-            release(ctx->sample_rows->row_arrays[c]);
-        }
+        tekoj::release_band_rows(ctx);
         release(ctx->sample_rows);
     }
     for (int t = 0; t < 4; ++t) release(ctx->divisors[t]);

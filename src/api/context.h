@@ -10,4 +10,10 @@ namespace tekoj {
 // buffer that only a completed stream would have freed already.
 void discard_context(EncoderContext* ctx);
 
+// The band sample rows of every component, allocated from the components'
+// geometry into the context's SampleRowSet (false after reporting error 3,
+// what was allocated left for release), and freed again.
+bool allocate_band_rows(EncoderContext* ctx);
+void release_band_rows(EncoderContext* ctx);
+
 }  // namespace tekoj

@@ -12,6 +12,8 @@
 // must not be "corrected".
 #include <TekoJEncoder.h>
 
+#include "display/rgb565_rows.h"
+
 #include <cstddef>
 #include <cstdint>
 
@@ -85,36 +87,24 @@ inline uint16_t pixel_of(uint8_t luma, const Chroma& c) {
     return static_cast<uint16_t>(((r >> 3) << 11) | ((g >> 2) << 5) | (b >> 3));
 }
 
-// Both source layouts share the walk; they differ only in where the Cb/Cr
-// pair of chroma sample k of a chroma row lives.
-struct ThreePlanes {
-    const uint8_t* u;  // Cb plane
-    const uint8_t* v;  // Cr plane
-    size_t chroma_width;
-    struct Row {
-        const uint8_t* u;
-        const uint8_t* v;
-        Chroma at(size_t k) const { return chroma_of(u[k], v[k]); }
-    };
-    Row row(size_t j) const { return {u + j * chroma_width, v + j * chroma_width}; }
+// Where the Cb/Cr pair of chroma sample k of a chroma row lives: in two
+// planes, or as the pair V, U of an interleaved row.
+struct PlanarRow {
+    const uint8_t* u;  // Cb
+    const uint8_t* v;  // Cr
+    Chroma at(size_t k) const { return chroma_of(u[k], v[k]); }
 };
 
-struct InterleavedVu {
-    const uint8_t* vu;  // pairs of V (Cr) first, then U (Cb)
-    size_t chroma_width;
-    struct Row {
-        const uint8_t* vu;
-        Chroma at(size_t k) const { return chroma_of(vu[2 * k + 1], vu[2 * k]); }
-    };
-    Row row(size_t j) const { return {vu + 2 * j * chroma_width}; }
+struct InterleavedRow {
+    const uint8_t* vu;
+    Chroma at(size_t k) const { return chroma_of(vu[2 * k + 1], vu[2 * k]); }
 };
 
 // Converts the luma row(s) that share one chroma row: two rows for every row
 // pair, one for the last row of an odd height.
 template <bool TwoRows, typename ChromaRow>
-inline void convert_rows(const ChromaRow& chroma, const uint8_t* y0, uint16_t* d0, size_t width) {
-    [[maybe_unused]] const uint8_t* y1 = y0 + width;
-    [[maybe_unused]] uint16_t* d1 = d0 + width;
+inline void convert_rows(const ChromaRow& chroma, const uint8_t* y0, const uint8_t* y1, uint16_t* d0, uint16_t* d1,
+                         size_t width) {
     const size_t pairs = width >> 1;
     for (size_t k = 0; k < pairs; ++k) {
         const Chroma c = chroma.at(k);
@@ -133,13 +123,36 @@ inline void convert_rows(const ChromaRow& chroma, const uint8_t* y0, uint16_t* d
     }
 }
 
-template <typename Source>
-void convert_frame(const Source& src, const uint8_t* luma, size_t width, size_t height, uint16_t* dst) {
-    for (size_t j = 0; j < (height >> 1); ++j)
-        convert_rows<true>(src.row(j), luma + 2 * j * width, dst + 2 * j * width, width);
+template <typename ChromaRow>
+void rows_of(const ChromaRow& chroma, const uint8_t* y0, const uint8_t* y1, uint16_t* d0, uint16_t* d1, size_t width) {
+    if (y1 != nullptr) {
+        convert_rows<true>(chroma, y0, y1, d0, d1, width);
+    } else {
+        convert_rows<false>(chroma, y0, y1, d0, d1, width);
+    }
+}
+
+void planar_rows(const uint8_t* y0, const uint8_t* y1, uint16_t* d0, uint16_t* d1, size_t width, const uint8_t* cb,
+                 const uint8_t* cr) {
+    rows_of(PlanarRow{cb, cr}, y0, y1, d0, d1, width);
+}
+
+void interleaved_rows(const uint8_t* y0, const uint8_t* y1, uint16_t* d0, uint16_t* d1, size_t width,
+                      const uint8_t* vu) {
+    rows_of(InterleavedRow{vu}, y0, y1, d0, d1, width);
+}
+
+// Row pairs share chroma row j; an odd height's last row has its own.
+// `rows(j, y0, y1, d0, d1)` converts one chroma row's luma rows.
+template <typename Rows>
+void convert_frame(const uint8_t* luma, size_t width, size_t height, uint16_t* dst, const Rows& rows) {
+    for (size_t j = 0; j < (height >> 1); ++j) {
+        const size_t top = 2 * j * width;
+        rows(j, luma + top, luma + top + width, dst + top, dst + top + width);
+    }
     if (height & 1) {
-        const size_t last = height - 1;
-        convert_rows<false>(src.row(height >> 1), luma + last * width, dst + last * width, width);
+        const size_t last = (height - 1) * width;
+        rows(height >> 1, luma + last, nullptr, dst + last, nullptr);
     }
 }
 
@@ -150,6 +163,32 @@ inline bool usable(const uint8_t* source, int32_t width, int32_t height, const u
 
 }  // namespace
 
+namespace tekoj {
+
+const DisplayKernels kPortableDisplayKernels = {planar_rows, interleaved_rows};
+
+const DisplayKernels* display_kernels_for(SimdLevel level) {
+    if (!simd_supported(level)) return nullptr;
+    switch (level) {
+        case SimdLevel::portable: return &kPortableDisplayKernels;
+        case SimdLevel::sse2: return display_kernels_sse2();
+        case SimdLevel::avx2:
+        case SimdLevel::avx512: return display_kernels_avx2();
+        case SimdLevel::neon: return display_kernels_neon();
+    }
+    return nullptr;
+}
+
+const DisplayKernels& display_kernels() {
+    static const DisplayKernels* const chosen = [] {
+        const DisplayKernels* k = display_kernels_for(simd_level());
+        return k != nullptr ? k : &kPortableDisplayKernels;
+    }();
+    return *chosen;
+}
+
+}  // namespace tekoj
+
 extern "C" {
 
 EKO_API uint32_t eko_DuoYUV420toRGB565(const uint8_t* source, int32_t width, int32_t height, uint16_t* destination) {
@@ -158,8 +197,12 @@ EKO_API uint32_t eko_DuoYUV420toRGB565(const uint8_t* source, int32_t width, int
     const size_t h = static_cast<size_t>(height);
     const size_t cw = (w + 1) >> 1;
     const size_t ch = (h + 1) >> 1;
-    const ThreePlanes planes{source + w * h, source + w * h + cw * ch, cw};
-    convert_frame(planes, source, w, h, destination);
+    const uint8_t* u = source + w * h;
+    const uint8_t* v = u + cw * ch;
+    const auto planar = tekoj::display_kernels().planar;
+    convert_frame(source, w, h, destination, [&](size_t j, const uint8_t* y0, const uint8_t* y1, uint16_t* d0, uint16_t* d1) {
+        planar(y0, y1, d0, d1, w, u + j * cw, v + j * cw);
+    });
     return 1;
 }
 
@@ -168,8 +211,12 @@ EKO_API uint32_t eko_DuoPYV0420toRGB565(const uint8_t* source, int32_t width, in
     if (!usable(source, width, height, destination)) return 0;
     const size_t w = static_cast<size_t>(width);
     const size_t h = static_cast<size_t>(height);
-    const InterleavedVu plane{source + w * h, (w + 1) >> 1};
-    convert_frame(plane, source, w, h, destination);
+    const uint8_t* vu = source + w * h;
+    const size_t row_bytes = 2 * ((w + 1) >> 1);
+    const auto interleaved = tekoj::display_kernels().interleaved;
+    convert_frame(source, w, h, destination, [&](size_t j, const uint8_t* y0, const uint8_t* y1, uint16_t* d0, uint16_t* d1) {
+        interleaved(y0, y1, d0, d1, w, vu + j * row_bytes);
+    });
     return 1;
 }
 

@@ -9,6 +9,8 @@
 // add accumulates all three without carries between them.
 #include <TekoJEncoder.h>
 
+#include "input/pixel_kernels.h"
+
 #include <cstddef>
 #include <cstdint>
 
@@ -81,6 +83,18 @@ void accumulate_row(const uint8_t* row, uint32_t sw, uint32_t dw, uint32_t* star
     }
 }
 
+// One output row from `count` accumulated words; 4:2:0 keeps the chroma of
+// even rows only.
+void write_row(const uint32_t* words, uint32_t count, Yuv420Cursor& cursor, int32_t row_index) {
+    const bool chroma = (row_index & 1) == 0;
+    tekoj::input_kernels().yuv_row(words, count, cursor.y, chroma ? cursor.u : nullptr, cursor.v);
+    cursor.y += count;
+    if (chroma) {
+        cursor.u += (count + 1) >> 1;
+        cursor.v += (count + 1) >> 1;
+    }
+}
+
 inline bool acceptable(const uint8_t* source, int32_t sw, int32_t sh, int32_t stride, const uint8_t* destination,
                        int32_t dw, int32_t dh) {
     if (source == nullptr || destination == nullptr) return false;
@@ -107,33 +121,7 @@ EKO_API void __eko_jpeg_enc_write_yuv_to_yuv420(const uint32_t* words, int32_t c
         eko_SetError(EKO_ERR_ARGUMENT);
         return;
     }
-    uint8_t* y = cursor->y;
-    if ((row_index & 1) != 0) {
-        // 4:2:0 keeps the chroma of even rows only.
-        for (int32_t i = 0; i < count; ++i) y[i] = static_cast<uint8_t>(words[i] >> 22);
-        cursor->y = y + count;
-        return;
-    }
-    uint8_t* u = cursor->u;
-    uint8_t* v = cursor->v;
-    // Chroma from the even column of each pair, not averaged with the odd one.
-    const int32_t pairs = count >> 1;
-    for (int32_t k = 0; k < pairs; ++k) {
-        const uint32_t even = words[2 * k];
-        *y++ = static_cast<uint8_t>(even >> 22);
-        *u++ = static_cast<uint8_t>(even >> 12);
-        *v++ = static_cast<uint8_t>(even >> 2);
-        *y++ = static_cast<uint8_t>(words[2 * k + 1] >> 22);
-    }
-    if ((count & 1) != 0) {
-        const uint32_t last = words[count - 1];
-        *y++ = static_cast<uint8_t>(last >> 22);
-        *u++ = static_cast<uint8_t>(last >> 12);
-        *v++ = static_cast<uint8_t>(last >> 2);
-    }
-    cursor->y = y;
-    cursor->u = u;
-    cursor->v = v;
+    write_row(words, static_cast<uint32_t>(count), *cursor, row_index);
 }
 
 EKO_API void __eko_jpeg_enc_down_scale_yuv422(const uint8_t* source, int32_t source_width, int32_t source_height,
@@ -173,12 +161,17 @@ EKO_API void __eko_jpeg_enc_down_scale_yuv422(const uint8_t* source, int32_t sou
     uint32_t finish_slot = 0;
     int32_t rows_written = 0;
     const uint8_t* row = source;
+    // Halving the width (the common preview case) takes both taps of column i
+    // from group i: a contiguous pass that vector kernels do.
+    const auto halve = sw == 2 * dw ? tekoj::input_kernels().halve422 : nullptr;
     for (int64_t y = 0; y < sh; ++y, scaled_y += dh, row += row_bytes) {
         const bool starts = next_first - scaled_y >= 0 && next_first - scaled_y < dh;
         const bool finishes = next_second - scaled_y >= 0 && next_second - scaled_y < dh;
         uint32_t* start = acc_rows[start_slot];
         uint32_t* finish = acc_rows[finish_slot];
-        if (starts && finishes) {
+        if (halve != nullptr) {
+            if (starts || finishes) halve(row, dw, starts ? start : nullptr, finishes ? finish : nullptr);
+        } else if (starts && finishes) {
             accumulate_row<RowRole::kBoth>(row, sw, dw, start, finish);
         } else if (starts) {
             accumulate_row<RowRole::kStarts>(row, sw, dw, start, finish);
@@ -186,7 +179,7 @@ EKO_API void __eko_jpeg_enc_down_scale_yuv422(const uint8_t* source, int32_t sou
             accumulate_row<RowRole::kFinishes>(row, sw, dw, start, finish);
         }
         if (finishes) {
-            __eko_jpeg_enc_write_yuv_to_yuv420(finish, destination_width, &cursor, rows_written++);
+            write_row(finish, dw, cursor, rows_written++);
             next_second += sh;
             finish_slot ^= 1;
         }

@@ -9,6 +9,7 @@
 #include <TekoJEncoder.h>
 
 #include "input/edge_fill.h"
+#include "input/pixel_kernels.h"
 
 #include <cstdint>
 
@@ -45,22 +46,6 @@ bool band_of(const EncoderContext* ctx, uint32_t luma_rows_per_chroma, Band& ban
     return band.comp[1]->band_rows >= chroma_needed && band.comp[2]->band_rows >= chroma_needed;
 }
 
-inline void split_row(const uint8_t* s, uint32_t groups, uint8_t* y, uint8_t* cb, uint8_t* cr) {
-    for (uint32_t k = 0; k < groups; ++k, s += 4) {
-        y[2 * k] = s[0];
-        cb[k] = s[1];
-        y[2 * k + 1] = s[2];
-        cr[k] = s[3];
-    }
-}
-
-inline void luma_only(const uint8_t* s, uint32_t groups, uint8_t* y) {
-    for (uint32_t k = 0; k < groups; ++k, s += 4) {
-        y[2 * k] = s[0];
-        y[2 * k + 1] = s[2];
-    }
-}
-
 void fill_no_data(const Band& band) {
     for (int c = 0; c < 3; ++c)
         for (uint32_t r = 0; r < band.comp[c]->band_rows; ++r)
@@ -95,17 +80,18 @@ EKO_API uint32_t __eko_jpeg_enc_get_raw_duoview422_data(EncoderContext* context)
     }
     const uint32_t rows = luma_rows_of(band);
     const uint32_t row_bytes = groups * 4;
+    const tekoj::InputKernels& k = tekoj::input_kernels();
     const uint8_t* s = context->read_ptr;
     uint32_t pairs = 0;
     for (uint32_t r = 0; r < rows; r += 2, ++pairs) {
-        split_row(s, groups, band.rows[0][r], band.rows[1][pairs], band.rows[2][pairs]);
+        k.split422(s, groups, band.rows[0][r], band.rows[1][pairs], band.rows[2][pairs]);
         s += row_bytes;
         // The lower row's chroma is dropped: 4:2:0 keeps the upper row's.
         // With an odd row count the last pair has no lower row in the
         // caller's buffer; the single last row then stands for both, which
         // the row repetition below provides.
         if (r + 1 < rows) {
-            luma_only(s, groups, band.rows[0][r + 1]);
+            k.luma422(s, groups, band.rows[0][r + 1]);
             s += row_bytes;
         }
     }
@@ -124,9 +110,10 @@ EKO_API uint32_t __eko_jpeg_enc_get_raw_duoview422_data_for_yuv422(EncoderContex
         return 1;
     }
     const uint32_t rows = luma_rows_of(band);
+    const auto split = tekoj::input_kernels().split422;
     const uint8_t* s = context->read_ptr;
     for (uint32_t r = 0; r < rows; ++r, s += groups * 4)
-        split_row(s, groups, band.rows[0][r], band.rows[1][r], band.rows[2][r]);
+        split(s, groups, band.rows[0][r], band.rows[1][r], band.rows[2][r]);
     context->read_ptr = s;
     fill_edges(band, groups, rows, rows);
     return 1;

@@ -9,4 +9,19 @@ namespace tekoj {
 // Runs the reader of the context's format for the current band.
 void read_band(EncoderContext* ctx);
 
+// Where a reader starts: the read positions that creation gave a context.
+struct ReadOrigin {
+    const uint8_t* read_ptr;
+    const uint8_t* plane[3];
+};
+
+inline ReadOrigin read_origin(const EncoderContext* ctx) {
+    return {ctx->read_ptr, {ctx->plane_y, ctx->plane_u, ctx->plane_v}};
+}
+
+// Points the read positions at the first image row of band `band`, as if
+// the bands before it had been read from `origin`, so that any band can be
+// read on its own.
+void seek_band(EncoderContext* ctx, const ReadOrigin& origin, uint32_t band);
+
 }  // namespace tekoj

@@ -98,4 +98,20 @@ void read_band(EncoderContext* ctx) {
     }
 }
 
+void seek_band(EncoderContext* ctx, const ReadOrigin& origin, uint32_t band) {
+    if (ctx->format == EKO_FORMAT_YUV420 || ctx->format == EKO_FORMAT_GREY) {
+        // Each earlier band took band_rows rows of every component's plane.
+        const uint8_t** planes[3] = {&ctx->plane_y, &ctx->plane_u, &ctx->plane_v};
+        for (uint32_t c = 0; c < ctx->num_components && c < 3; ++c) {
+            const ComponentInfo& comp = ctx->comp_info[c];
+            const size_t skip = static_cast<size_t>(band) * comp.band_rows * comp.downsampled_width;
+            *planes[c] = origin.plane[c] == nullptr ? nullptr : origin.plane[c] + skip;
+        }
+        return;
+    }
+    const size_t bytes_per_pixel = ctx->format == EKO_FORMAT_RGB565 ? 2 : ctx->format == EKO_FORMAT_RGB888 ? 3 : 4;
+    const size_t rows = static_cast<size_t>(band) * ctx->max_v_samp * 8u;
+    ctx->read_ptr = origin.read_ptr + rows * static_cast<size_t>(ctx->width) * bytes_per_pixel;
+}
+
 }  // namespace tekoj

@@ -1,0 +1,224 @@
+// NEON row kernels of the input readers. The structure loads (vld3, vld4)
+// split the channels; seen as 16-bit lanes, each channel vector holds the
+// even pixels in its low bytes and the odd ones in its high bytes, which is
+// exactly the split that chroma from even pixels needs. Sums are formed in
+// 32-bit lanes by widening multiply-accumulate, the same integers as the
+// portable code; the chroma bias keeps them non-negative, so unsigned
+// wrap-around in the intermediate steps cancels out.
+#include "input/pixel_kernels.h"
+
+#if defined(__ARM_NEON) || defined(__ARM_NEON__)
+
+#include <arm_neon.h>
+
+#include <cstddef>
+
+namespace tekoj {
+namespace {
+
+struct Channels {
+    uint16x8_t r, g, b;
+};
+
+inline uint16x4_t luma4(uint16x4_t r, uint16x4_t g, uint16x4_t b) {
+    uint32x4_t s = vmull_n_u16(r, rgb::kYr);
+    s = vmlal_n_u16(s, g, rgb::kYg);
+    s = vmlal_n_u16(s, b, rgb::kYb);
+    return vshrn_n_u32(s, 12);
+}
+
+inline uint8x8_t luma8(const Channels& c) {
+    return vmovn_u16(vcombine_u16(luma4(vget_low_u16(c.r), vget_low_u16(c.g), vget_low_u16(c.b)),
+                                  luma4(vget_high_u16(c.r), vget_high_u16(c.g), vget_high_u16(c.b))));
+}
+
+// Bias + 2048 * plus - m1 * minus1 - m2 * minus2: the shape of both chroma
+// sums (Cb: plus B, minus R and G; Cr: plus R, minus G and B).
+template <uint16_t M1, uint16_t M2>
+inline uint16x4_t chroma4(uint16x4_t plus, uint16x4_t minus1, uint16x4_t minus2) {
+    uint32x4_t s = vmlal_n_u16(vdupq_n_u32(rgb::kChromaBias), plus, 2048);
+    s = vmlsl_n_u16(s, minus1, M1);
+    s = vmlsl_n_u16(s, minus2, M2);
+    return vshrn_n_u32(s, 12);
+}
+
+static_assert(rgb::kCbB == 2048 && rgb::kCrR == 2048);
+
+inline uint8x8_t cb8(const Channels& c) {
+    constexpr uint16_t r = -rgb::kCbR, g = -rgb::kCbG;
+    return vmovn_u16(vcombine_u16(chroma4<r, g>(vget_low_u16(c.b), vget_low_u16(c.r), vget_low_u16(c.g)),
+                                  chroma4<r, g>(vget_high_u16(c.b), vget_high_u16(c.r), vget_high_u16(c.g))));
+}
+
+inline uint8x8_t cr8(const Channels& c) {
+    constexpr uint16_t g = -rgb::kCrG, b = -rgb::kCrB;
+    return vmovn_u16(vcombine_u16(chroma4<g, b>(vget_low_u16(c.r), vget_low_u16(c.g), vget_low_u16(c.b)),
+                                  chroma4<g, b>(vget_high_u16(c.r), vget_high_u16(c.g), vget_high_u16(c.b))));
+}
+
+// Sixteen pixels' channels, even pixels and odd pixels apart.
+struct EvenOdd {
+    Channels even, odd;
+};
+
+template <int Bpp, bool Bgr>
+inline EvenOdd load16(const uint8_t* p) {
+    uint8x16_t r, g, b;
+    if constexpr (Bpp == 3) {
+        const uint8x16x3_t v = vld3q_u8(p);
+        r = v.val[0], g = v.val[1], b = v.val[2];
+    } else {
+        const uint8x16x4_t v = vld4q_u8(p);
+        r = v.val[Bgr ? 2 : 0], g = v.val[1], b = v.val[Bgr ? 0 : 2];
+    }
+    const uint16x8_t low = vdupq_n_u16(0x00FF);
+    const uint16x8_t r16 = vreinterpretq_u16_u8(r), g16 = vreinterpretq_u16_u8(g), b16 = vreinterpretq_u16_u8(b);
+    return {{vandq_u16(r16, low), vandq_u16(g16, low), vandq_u16(b16, low)},
+            {vshrq_n_u16(r16, 8), vshrq_n_u16(g16, 8), vshrq_n_u16(b16, 8)}};
+}
+
+template <int Bpp, bool Bgr, PickLayout Layout>
+void pick_upper(const uint8_t* src, uint32_t w, uint8_t* y, uint8_t* cb, uint8_t* cr) {
+    uint32_t x = 0;
+    for (; x + 16 <= w; x += 16) {
+        const EvenOdd px = load16<Bpp, Bgr>(src + static_cast<size_t>(x) * Bpp);
+        vst2_u8(y + x, (uint8x8x2_t{{luma8(px.even), luma8(px.odd)}}));
+        vst1_u8(cb + x / 2, cb8(px.even));
+        vst1_u8(cr + x / 2, cr8(px.even));
+    }
+    kPortableInputKernels.pick_upper[Layout](src + static_cast<size_t>(x) * Bpp, w - x, y + x, cb + x / 2, cr + x / 2);
+}
+
+template <int Bpp, bool Bgr, PickLayout Layout>
+void pick_lower(const uint8_t* src, uint32_t w, uint8_t* y) {
+    uint32_t x = 0;
+    for (; x + 16 <= w; x += 16) {
+        const EvenOdd px = load16<Bpp, Bgr>(src + static_cast<size_t>(x) * Bpp);
+        vst2_u8(y + x, (uint8x8x2_t{{luma8(px.even), luma8(px.odd)}}));
+    }
+    kPortableInputKernels.pick_lower[Layout](src + static_cast<size_t>(x) * Bpp, w - x, y + x);
+}
+
+// Each 5- or 6-bit field moves to the top of a byte plus half a step.
+inline Channels expand565(uint16x8_t p) {
+    return {vaddq_u16(vandq_u16(vshrq_n_u16(p, 8), vdupq_n_u16(0xF8)), vdupq_n_u16(4)),
+            vaddq_u16(vandq_u16(vshrq_n_u16(p, 3), vdupq_n_u16(0xFC)), vdupq_n_u16(2)),
+            vaddq_u16(vandq_u16(vshlq_n_u16(p, 3), vdupq_n_u16(0xF8)), vdupq_n_u16(4))};
+}
+
+void rgb565_blocks(const uint8_t* upper, const uint8_t* lower, uint32_t blocks, uint8_t* y0, uint8_t* y1, uint8_t* cb,
+                   uint8_t* cr) {
+    uint32_t k = 0;
+    for (; k + 8 <= blocks; k += 8) {
+        // Even and odd pixels of 16-pixel runs of both rows.
+        const uint16x8x2_t u = vld2q_u16(reinterpret_cast<const uint16_t*>(upper + 4 * k));
+        const uint16x8x2_t l = vld2q_u16(reinterpret_cast<const uint16_t*>(lower + 4 * k));
+        const Channels ue = expand565(u.val[0]), uo = expand565(u.val[1]);
+        const Channels le = expand565(l.val[0]), lo = expand565(l.val[1]);
+        vst2_u8(y0 + 2 * k, (uint8x8x2_t{{luma8(ue), luma8(uo)}}));
+        vst2_u8(y1 + 2 * k, (uint8x8x2_t{{luma8(le), luma8(lo)}}));
+        // Green alone gets the rounding term of the average.
+        const Channels avg{
+            vshrq_n_u16(vaddq_u16(vaddq_u16(ue.r, uo.r), vaddq_u16(le.r, lo.r)), 2),
+            vshrq_n_u16(vaddq_u16(vaddq_u16(vaddq_u16(ue.g, uo.g), vaddq_u16(le.g, lo.g)), vdupq_n_u16(2)), 2),
+            vshrq_n_u16(vaddq_u16(vaddq_u16(ue.b, uo.b), vaddq_u16(le.b, lo.b)), 2)};
+        vst1_u8(cb + k, cb8(avg));
+        vst1_u8(cr + k, cr8(avg));
+    }
+    kPortableInputKernels.rgb565_blocks(upper + 4 * k, lower + 4 * k, blocks - k, y0 + 2 * k, y1 + 2 * k, cb + k,
+                                        cr + k);
+}
+
+// Packed 4:2:2: sixteen groups per step, split into Y0, U, Y1 and V by one
+// structure load.
+void split422(const uint8_t* s, uint32_t groups, uint8_t* y, uint8_t* cb, uint8_t* cr) {
+    uint32_t k = 0;
+    for (; k + 16 <= groups; k += 16) {
+        const uint8x16x4_t v = vld4q_u8(s + 4 * k);
+        vst2q_u8(y + 2 * k, (uint8x16x2_t{{v.val[0], v.val[2]}}));
+        vst1q_u8(cb + k, v.val[1]);
+        vst1q_u8(cr + k, v.val[3]);
+    }
+    kPortableInputKernels.split422(s + 4 * k, groups - k, y + 2 * k, cb + k, cr + k);
+}
+
+void luma422(const uint8_t* s, uint32_t groups, uint8_t* y) {
+    uint32_t k = 0;
+    for (; k + 16 <= groups; k += 16) {
+        const uint8x16x4_t v = vld4q_u8(s + 4 * k);
+        vst2q_u8(y + 2 * k, (uint8x16x2_t{{v.val[0], v.val[2]}}));
+    }
+    kPortableInputKernels.luma422(s + 4 * k, groups - k, y + 2 * k);
+}
+
+// Halving down-scaler: sixteen groups per step; (Y0 + Y1) << 20 | U << 11 |
+// V << 1 assembled by widening shifts.
+inline uint32x4_t halve4(uint16x4_t y, uint16x4_t u, uint16x4_t v) {
+    return vorrq_u32(vorrq_u32(vshlq_n_u32(vshll_n_u16(y, 16), 4), vshll_n_u16(u, 11)), vshll_n_u16(v, 1));
+}
+
+inline void halve_store(uint32x4_t sum, uint32_t* start, uint32_t* finish, uint32_t i) {
+    if (start != nullptr) vst1q_u32(start + i, sum);
+    if (finish != nullptr) vst1q_u32(finish + i, vaddq_u32(vld1q_u32(finish + i), sum));
+}
+
+void halve422(const uint8_t* s, uint32_t dw, uint32_t* start, uint32_t* finish) {
+    uint32_t i = 0;
+    for (; i + 16 <= dw; i += 16) {
+        const uint8x16x4_t g = vld4q_u8(s + 4 * i);
+        const uint16x8_t ylo = vaddl_u8(vget_low_u8(g.val[0]), vget_low_u8(g.val[2]));
+        const uint16x8_t yhi = vaddl_u8(vget_high_u8(g.val[0]), vget_high_u8(g.val[2]));
+        const uint16x8_t ulo = vmovl_u8(vget_low_u8(g.val[1])), uhi = vmovl_u8(vget_high_u8(g.val[1]));
+        const uint16x8_t vlo = vmovl_u8(vget_low_u8(g.val[3])), vhi = vmovl_u8(vget_high_u8(g.val[3]));
+        halve_store(halve4(vget_low_u16(ylo), vget_low_u16(ulo), vget_low_u16(vlo)), start, finish, i);
+        halve_store(halve4(vget_high_u16(ylo), vget_high_u16(ulo), vget_high_u16(vlo)), start, finish, i + 4);
+        halve_store(halve4(vget_low_u16(yhi), vget_low_u16(uhi), vget_low_u16(vhi)), start, finish, i + 8);
+        halve_store(halve4(vget_high_u16(yhi), vget_high_u16(uhi), vget_high_u16(vhi)), start, finish, i + 12);
+    }
+    kPortableInputKernels.halve422(s + 4 * i, dw - i, start != nullptr ? start + i : nullptr,
+                                   finish != nullptr ? finish + i : nullptr);
+}
+
+// Down-scaler row writer: sixteen words per step, even and odd apart.
+// Narrowing keeps the low bits, so no mask is needed after the shift.
+template <int Shift>
+inline uint8x8_t top8(uint32x4_t a, uint32x4_t b) {
+    return vmovn_u16(vcombine_u16(vmovn_u32(vshrq_n_u32(a, Shift)), vmovn_u32(vshrq_n_u32(b, Shift))));
+}
+
+void yuv_row(const uint32_t* words, uint32_t count, uint8_t* y, uint8_t* u, uint8_t* v) {
+    uint32_t i = 0;
+    for (; i + 16 <= count; i += 16) {
+        const uint32x4x2_t a = vld2q_u32(words + i), b = vld2q_u32(words + i + 8);  // even, odd
+        vst2_u8(y + i, (uint8x8x2_t{{top8<22>(a.val[0], b.val[0]), top8<22>(a.val[1], b.val[1])}}));
+        if (u == nullptr) continue;
+        vst1_u8(u + i / 2, top8<12>(a.val[0], b.val[0]));
+        vst1_u8(v + i / 2, top8<2>(a.val[0], b.val[0]));
+    }
+    kPortableInputKernels.yuv_row(words + i, count - i, y + i, u != nullptr ? u + i / 2 : nullptr,
+                                  v != nullptr ? v + i / 2 : nullptr);
+}
+
+const InputKernels kNeon = {
+    {pick_upper<3, false, kRgb888>, pick_upper<4, false, kRgba8888>, pick_upper<4, true, kBgra8888>},
+    {pick_lower<3, false, kRgb888>, pick_lower<4, false, kRgba8888>, pick_lower<4, true, kBgra8888>},
+    rgb565_blocks,
+    split422,
+    luma422,
+    halve422,
+    yuv_row,
+};
+
+}  // namespace
+
+const InputKernels* input_kernels_neon() { return &kNeon; }
+
+}  // namespace tekoj
+
+#else
+
+namespace tekoj {
+const InputKernels* input_kernels_neon() { return nullptr; }
+}  // namespace tekoj
+
+#endif
