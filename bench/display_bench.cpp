@@ -4,7 +4,7 @@
 // the best of several timed runs, to keep scheduler noise out.
 //
 //   tekoj_display_bench [repetitions]
-#include <TekoJEncoder.h>
+#include <TekoJEncoderInternal.h>
 
 #include <chrono>
 #include <cstdio>

@@ -3,7 +3,8 @@
 # NEON forced on, counted under qemu-arm (../shared/tools/arm-icount): each
 # case runs with 1 and 3 repetitions and half the difference is one encode.
 #
-#   scripts/arm-icount-bench.sh [quick]     quick: RGB888, YUV 4:2:0, grey only
+#   scripts/arm-icount-bench.sh [quick|parallel]     quick: RGB888, YUV 4:2:0, grey only;
+#                                                    parallel: the row-parallel calls' overhead
 # Environment: TEKOJ_SIMD forces our level (portable, neon); BUILD_DIR.
 # Skips (status 0) where the cross tool chain, qemu-arm or armhf TurboJPEG is absent.
 set -eu
@@ -23,7 +24,7 @@ command -v qemu-arm >/dev/null 2>&1 || skip "no qemu-arm"
 [ -f "$IMAGE" ] || skip "no image $IMAGE"
 
 cmake -S . -B "$BUILD_DIR" -G Ninja -DCMAKE_BUILD_TYPE=Release -DCMAKE_TOOLCHAIN_FILE=cmake/toolchains/armhf.cmake \
-  -DTEKOJ_BUILD_TESTS=OFF -DTEKOJ_BUILD_TOOLS=OFF >/dev/null 2>&1 || skip "armhf configure failed"
+  -DTEKOJ_BUILD_BENCH=ON -DTEKOJ_BUILD_TESTS=OFF -DTEKOJ_BUILD_TOOLS=OFF >/dev/null 2>&1 || skip "armhf configure failed"
 cmake --build "$BUILD_DIR" -j 2 --target arm_icount_bench >/dev/null
 BIN=$BUILD_DIR/bench/arm_icount_bench
 RAW=$BUILD_DIR/frame-${W}x${H}.rgb
@@ -40,6 +41,19 @@ per_pixel() {  # who env format q -> instructions per pixel of one encode
 
 OURS_ENV=""
 [ -n "${TEKOJ_SIMD:-}" ] && OURS_ENV="TEKOJ_SIMD=$TEKOJ_SIMD"
+if [ "${1:-}" = parallel ]; then
+  # The row-parallel path, driven from one thread, against the whole-image call.
+  echo "ARM instructions per pixel, ${W}x${H} crop, single-threaded call against the row-parallel calls"
+  printf '%-11s %3s %8s %8s %9s\n' input q whole parallel overhead
+  for fmt in rgb888 yuv420 grey; do
+    for q in 75 90; do
+      o=$(per_pixel ours "$OURS_ENV" $fmt $q)
+      p=$(per_pixel parallel "$OURS_ENV" $fmt $q)
+      printf '%-11s %3s %8s %8s %8s%%\n' $fmt $q "$o" "$p" "$(awk -v a="$o" -v b="$p" 'BEGIN { printf "%.2f", (b / a - 1) * 100 }')"
+    done
+  done
+  exit 0
+fi
 echo "ARM instructions per pixel, ${W}x${H} top-left crop of $(basename "$IMAGE"), 4:2:0, fast DCT, to memory"
 echo "ours: TEKOJ_SIMD=${TEKOJ_SIMD:-auto}; libjpeg-turbo: JSIMD_FORCENEON=1"
 printf '%-11s %3s %8s %8s %7s\n' input q ours turbo ratio

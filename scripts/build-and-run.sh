@@ -1,6 +1,7 @@
 #!/bin/sh
-# Installs the build tools, builds the library and the command-line tool, and
-# encodes the built-in sample image to build/tekoj-sample.jpg.
+# Installs the build tools, builds the library and the command-line tool in
+# build/, and encodes the tool's built-in sample image to
+# build/tekoj-sample.jpg.
 set -eu
 cd "$(dirname "$0")/.."
 SUDO=""
@@ -11,6 +12,12 @@ if ! command -v cmake >/dev/null || ! command -v g++ >/dev/null || ! command -v 
   $SUDO apt-get update -q
   $SUDO apt-get install -y -q cmake g++ ninja-build pkg-config libpng-dev
 fi
-cmake -S . -B build -G Ninja -DCMAKE_BUILD_TYPE=Release -DTEKOJ_BUILD_TESTS=OFF -DTEKOJ_BUILD_BENCH=OFF
+cmake -S . -B build -G Ninja -DCMAKE_BUILD_TYPE=Release -DTEKOJ_BUILD_TOOLS=ON
 cmake --build build
-cd build && ./tools/tekoj-encode
+out=build/tekoj-sample.jpg
+if [ -x build/tools/tekoj ]; then
+  build/tools/tekoj --sample "$out"
+else
+  (cd build && ./tools/tekoj-encode)
+fi
+echo "wrote $out ($(wc -c < "$out") bytes)"

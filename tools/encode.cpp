@@ -14,6 +14,8 @@
 // coding pass, as the band call would run the format's own reader.
 #include "exif.h"
 
+#include <TekoJEncoderInternal.h>
+
 #include <algorithm>
 #include <cstdio>
 #include <cstring>

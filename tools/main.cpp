@@ -11,10 +11,6 @@
 #include <set>
 #include <unistd.h>
 
-#ifndef TEKOJ_TOOL_VERSION
-#define TEKOJ_TOOL_VERSION "unknown"
-#endif
-
 namespace {
 
 using namespace tool;
@@ -292,12 +288,8 @@ int main(int argc, char** argv) {
         return std::fflush(stdout) == 0 ? 0 : 1;
     }
     if (a.version) {
-#ifdef TEKOJ_VERSION_MAJOR
         const uint32_t v = eko_GetVersion();
         std::printf("tekoj (libTekoJEncoder) %u.%u.%u\n", v / 10000, v / 100 % 100, v % 100);
-#else
-        std::printf("tekoj (libTekoJEncoder) %s\n", TEKOJ_TOOL_VERSION);
-#endif
         return std::fflush(stdout) == 0 ? 0 : 1;
     }
 

@@ -2,7 +2,7 @@
 // interface.
 #pragma once
 
-#include <TekoJEncoder.h>
+#include <TekoJEncoderInternal.h>
 
 namespace tekoj {
 

@@ -1,6 +1,6 @@
 // Error hook. The code of the last failure is kept per thread so that callers
 // (and the C++ API) can say why a call returned 0; no operation reads it.
-#include <TekoJEncoder.h>
+#include <TekoJEncoderInternal.h>
 
 namespace {
 thread_local uint32_t last_error = EKO_OK;

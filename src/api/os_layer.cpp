@@ -1,7 +1,7 @@
 // The built-in operating-system layer: a thin skin over the C library. A
 // build with TEKOJ_EXTERNAL_OS_LAYER leaves this file out and takes the same
 // symbols from the sibling decoder library instead.
-#include <TekoJEncoder.h>
+#include <TekoJEncoderInternal.h>
 
 #include <cstdio>
 #include <cstdlib>

@@ -3,7 +3,7 @@
 // work buffer to the file or the stream callback).
 #pragma once
 
-#include <TekoJEncoder.h>
+#include <TekoJEncoderInternal.h>
 
 #include <cstdint>
 

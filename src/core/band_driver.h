@@ -2,7 +2,7 @@
 // MCU-row interface.
 #pragma once
 
-#include <TekoJEncoder.h>
+#include <TekoJEncoderInternal.h>
 
 namespace tekoj {
 

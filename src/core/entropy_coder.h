@@ -2,7 +2,7 @@
 // stuffing and restart markers.
 #pragma once
 
-#include <TekoJEncoder.h>
+#include <TekoJEncoderInternal.h>
 
 #include <cstdint>
 

@@ -9,7 +9,7 @@
 // (|x * m| < 2^31) and the coefficient fits 16 bits.
 #pragma once
 
-#include <TekoJEncoder.h>
+#include <TekoJEncoderInternal.h>
 
 #include "core/simd_level.h"
 

@@ -2,7 +2,7 @@
 // block coder looks codes up in, and the magnitude-category table.
 #include "core/huffman_tables.h"
 
-#include <TekoJEncoder.h>
+#include <TekoJEncoderInternal.h>
 
 #include <array>
 #include <cstring>

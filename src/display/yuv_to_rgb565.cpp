@@ -10,7 +10,7 @@
 // byte of 128 already adds a small tint (R +1, G -1, B +2). Callers compare
 // previews against this exact output; the offset is part of the contract and
 // must not be "corrected".
-#include <TekoJEncoder.h>
+#include <TekoJEncoderInternal.h>
 
 #include "display/rgb565_rows.h"
 

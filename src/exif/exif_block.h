@@ -1,7 +1,7 @@
 // EXIF block builder internals shared with the APP1 writer (and its tests).
 #pragma once
 
-#include <TekoJEncoder.h>
+#include <TekoJEncoderInternal.h>
 
 #include <cstdint>
 #include <ctime>

@@ -3,7 +3,7 @@
 // row streams, which the context's own release does not cover.
 #pragma once
 
-#include <TekoJEncoder.h>
+#include <TekoJEncoderInternal.h>
 
 #include <cstdint>
 

@@ -7,7 +7,7 @@
 // The three sums of a pixel travel packed in one 32-bit word (Y << 20 |
 // U << 10 | V); a field holds at most 4 x 255 = 1020 < 1024, so one integer
 // add accumulates all three without carries between them.
-#include <TekoJEncoder.h>
+#include <TekoJEncoderInternal.h>
 
 #include "input/pixel_kernels.h"
 

@@ -3,7 +3,7 @@
 // copies of the nearest image sample, never stale or uninitialised bytes.
 #pragma once
 
-#include <TekoJEncoder.h>
+#include <TekoJEncoderInternal.h>
 
 #include <cstdint>
 

@@ -6,7 +6,7 @@
 // the chroma of the upper row of every row pair; the other keeps 4:2:2 for an
 // encoder set up with Y 2x1. Like every reader they fill one band of sample
 // rows per call, read through read_ptr and leave it at the next band.
-#include <TekoJEncoder.h>
+#include <TekoJEncoderInternal.h>
 
 #include "input/edge_fill.h"
 #include "input/pixel_kernels.h"

@@ -2,7 +2,7 @@
 // pixels, in the layout that the context's format code names.
 #pragma once
 
-#include <TekoJEncoder.h>
+#include <TekoJEncoderInternal.h>
 
 namespace tekoj {
 

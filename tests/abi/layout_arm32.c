@@ -1,5 +1,5 @@
 /* Compiled for 32-bit ARM only: the header's layout assertions must hold. */
-#include <TekoJEncoder.h>
+#include <TekoJEncoderInternal.h>
 
 _Static_assert(sizeof(void*) == 4, "built for a 32-bit target");
 _Static_assert(sizeof(EncoderSettings) == 292, "EncoderSettings size");

@@ -4,7 +4,7 @@
 // result with its code, leaks no block, leaves no file open and leaves the
 // caller's variables as the header says; the first call let through gives
 // the normal stream.
-#include <TekoJEncoder.h>
+#include <TekoJEncoderInternal.h>
 
 #include "incremental/incremental_support.h"
 #include "support/fault_os_layer.h"

@@ -1,7 +1,7 @@
 // Whole-image entry points: streams decode cleanly for every format, size and
 // quality; every output kind yields the same bytes; bands coded by separate
 // calls join to the one-call stream; concurrent calls do not interfere.
-#include <TekoJEncoder.h>
+#include <TekoJEncoderInternal.h>
 
 #include "support/fault_os_layer.h"
 #include "support/test_support.h"

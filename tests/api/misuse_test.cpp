@@ -1,7 +1,7 @@
 // Refused calls: null arguments, bad formats and dimensions, output kinds and
 // EncoderSettings records that cannot be served. Each returns 0 (or null),
 // reports its code (kept per thread), leaks no block and leaves no file open.
-#include <TekoJEncoder.h>
+#include <TekoJEncoderInternal.h>
 
 #include "support/fault_os_layer.h"
 #include "support/test_support.h"

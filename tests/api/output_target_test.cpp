@@ -1,6 +1,6 @@
 // Output targets never write past their capacity; memory targets grow by
 // 4096 bytes, then geometrically, keeping the bytes written.
-#include <TekoJEncoder.h>
+#include <TekoJEncoderInternal.h>
 
 #include "support/test_support.h"
 

@@ -2,7 +2,7 @@
 // tables at every quality, the forward transform, the Huffman tables, the bit
 // writer with its padding and restart steps, and coefficient blocks read back
 // by libjpeg.
-#include <TekoJEncoder.h>
+#include <TekoJEncoderInternal.h>
 
 #include "support/test_support.h"
 

@@ -1,6 +1,6 @@
 // YUV 4:2:0 to RGB565: exported tables, single pixels, refused arguments and
 // golden frames (odd sizes, both source layouts).
-#include <TekoJEncoder.h>
+#include <TekoJEncoderInternal.h>
 
 #include "support/test_support.h"
 

@@ -1,6 +1,6 @@
 // The 4:2:2 down-scaler: the golden case, refusals, and its output going
 // straight into the encoder as format 2.
-#include <TekoJEncoder.h>
+#include <TekoJEncoderInternal.h>
 
 #include "support/fault_os_layer.h"
 #include "support/test_support.h"

@@ -1,7 +1,7 @@
 // The packed 4:2:2 readers: band rows of the defined examples and edges on
 // real contexts, and whole frames encoded through the exported coding steps
 // and decoded by libjpeg-turbo.
-#include <TekoJEncoder.h>
+#include <TekoJEncoderInternal.h>
 
 #include "support/fault_os_layer.h"
 #include "support/test_support.h"

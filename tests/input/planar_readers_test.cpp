@@ -1,6 +1,6 @@
 // Planar readers on real contexts: repeated edges of the last bands, and the
 // interleaved V/U reader filling the same edge cells.
-#include <TekoJEncoder.h>
+#include <TekoJEncoderInternal.h>
 
 #include "support/test_support.h"
 

@@ -2,7 +2,7 @@
 // written ones repeats the last written column and row (no stale or
 // uninitialised bytes), RGB565 of width 1 included. The conversions
 // themselves are pinned by the golden streams.
-#include <TekoJEncoder.h>
+#include <TekoJEncoderInternal.h>
 
 #include "support/test_support.h"
 

@@ -1,6 +1,6 @@
 #include "support/fault_os_layer.h"
 
-#include <TekoJEncoder.h>
+#include <TekoJEncoderInternal.h>
 
 #include <atomic>
 #include <cstdio>

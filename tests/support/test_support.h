@@ -2,7 +2,7 @@
 // generators, golden files.
 #pragma once
 
-#include <TekoJEncoder.h>
+#include <TekoJEncoderInternal.h>
 
 #include <cstdint>
 #include <string>
