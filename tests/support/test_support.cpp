@@ -53,6 +53,16 @@ double psnr(const uint8_t* a, const uint8_t* b, size_t count) {
     return 10.0 * std::log10(255.0 * 255.0 * static_cast<double>(count) / se);
 }
 
+Bytes noise_with_extremes(size_t n, uint32_t seed) {
+    Bytes b(n);
+    for (auto& v : b) {
+        seed = seed * 1664525u + 1013904223u;
+        const uint32_t pick = seed >> 30;
+        v = pick == 0 ? 0 : pick == 1 ? 255 : static_cast<uint8_t>(seed >> 16);
+    }
+    return b;
+}
+
 Bytes photo_rgb(int width, int height, uint32_t seed) {
     Bytes out(static_cast<size_t>(width) * height * 3);
     uint32_t s = seed * 2654435761u + 12345u;

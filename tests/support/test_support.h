@@ -26,6 +26,9 @@ Decoded decode_jpeg(const Bytes& jpeg, bool force_grey = false);
 // Peak signal-to-noise ratio of two same-sized sample arrays, in dB.
 double psnr(const uint8_t* a, const uint8_t* b, size_t count);
 
+// Random bytes, a quarter of them 0 and a quarter 255, so that the extremes of
+// every sum a kernel forms occur.
+Bytes noise_with_extremes(size_t n, uint32_t seed);
 // A smooth, photo-like RGB image (gradients, soft edges, mild texture).
 Bytes photo_rgb(int width, int height, uint32_t seed = 1);
 // Converts interleaved RGB to another input layout of the library.
