@@ -5,9 +5,10 @@
 //
 //   arm_icount_bench prepare image.jpg frame.rgb WIDTH HEIGHT
 //       decodes the top-left WIDTH x HEIGHT crop of image.jpg to raw RGB888
-//   arm_icount_bench ours|turbo FORMAT QUALITY REPS frame.rgb WIDTH HEIGHT
+//   arm_icount_bench ours|turbo|parallel FORMAT QUALITY REPS frame.rgb WIDTH HEIGHT
 //       FORMAT: rgb888 rgba8888 bgra8888 rgb565 yuv420 grey (both), nv21
-//       packed422 packed422k downscale rgb565conv pyv565conv (ours only)
+//       packed422 packed422k downscale rgb565conv pyv565conv (ours only);
+//       parallel: the whole-image formats through the row-parallel calls
 //
 // All codings are 4:2:0 (grey: one component) with the fast integer DCT, to
 // memory. The derived inputs (YUV planes, packed 4:2:2, RGB565) are built
@@ -195,8 +196,26 @@ int main(int argc, char** argv) {
         }
         tjFree(out);
         tjDestroy(t);
+    } else if (who == "parallel" && whole != nullptr) {
+        // The row-parallel calls driven from this one thread, two workers
+        // taking turns row by row: the path's own cost, without threads.
+        ImageInfo info{f.w, f.h, whole_data(f, format), 0, 0, 0, 0, 0, whole->format, nullptr};
+        const EncodeOptions options{static_cast<uint32_t>(quality), nullptr, 0};
+        for (int i = 0; i < reps; ++i) {
+            const uint32_t cap = static_cast<uint32_t>(f.w * f.h * 2 + 65536);
+            const OutputRequest req{EKO_OUTPUT_MEMORY, nullptr, static_cast<uint8_t*>(DORVATEKO_OsMalloc(cap)), cap};
+            EkoParallelEncode* e = eko_enc_jpeg_parallel_create(&info, &req, &options, nullptr, nullptr, nullptr, 2);
+            const uint32_t rows = eko_enc_jpeg_parallel_row_count(e);
+            for (uint32_t k = 0; k < rows; ++k)
+                if (eko_enc_jpeg_parallel_rows(e, k & 1, k, 1) != 1) return fail("parallel rows failed");
+            uint8_t* block = nullptr;
+            uint32_t length = 0;
+            if (eko_enc_jpeg_parallel_finish(e, &block, &length) != 1) return fail("parallel finish failed");
+            DORVATEKO_OsFree(block);
+            bytes = length;
+        }
     } else if (who != "ours") {
-        return fail("first argument: ours or turbo");
+        return fail("first argument: ours, parallel or turbo");
     } else if (whole != nullptr) {
         ImageInfo info{f.w, f.h, whole_data(f, format), 0, 0, 0, 0, 0, whole->format, nullptr};
         const int32_t cap = f.w * f.h * 2 + 65536;

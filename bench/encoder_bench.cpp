@@ -1,20 +1,24 @@
 // Encoder speed against libjpeg-turbo's TurboJPEG API at the same settings:
-// 4:2:0 (from RGB and from planar YUV), grey; qualities 75 and 90; fast
+// 4:2:0 (from RGB888, RGBA8888, BGRA8888 and planar YUV), grey; qualities 75 and 90; fast
 // integer DCT. Prints megapixels per second of both and their ratio, then the
 // peak resident memory that an encode to a file adds.
 //
-//   tekoj_bench [image.jpg|image.ppm] [repetitions]
+//   tekoj_bench [--threads N] [image.jpg|image.ppm] [repetitions]
+//   tekoj_bench --rss [--threads N] [--tall] [image]   memory of an encode to a file
+//   tekoj_bench --rows [image]                per-row times, simulated scaling
 //
 // Set JSIMD_FORCENONE=1 to compare against libjpeg-turbo without its SIMD.
 #include <TekoJEncoderInternal.h>
 #include <turbojpeg.h>
 
 #include <algorithm>
+#include <atomic>
 #include <chrono>
 #include <cstdio>
 #include <cstdlib>
 #include <cstring>
 #include <functional>
+#include <thread>
 #include <string>
 #include <vector>
 
@@ -24,7 +28,7 @@ using Clock = std::chrono::steady_clock;
 
 struct Image {
     int width = 0, height = 0;
-    std::vector<uint8_t> rgb, yuv, grey;
+    std::vector<uint8_t> rgb, yuv, grey, rgba, bgra;
 };
 
 bool load(const std::string& path, Image& img) {
@@ -48,6 +52,14 @@ bool load(const std::string& path, Image& img) {
 void derive(Image& img) {
     const int w = img.width, hgt = img.height, cw = (w + 1) / 2, ch = (hgt + 1) / 2;
     img.grey.resize(static_cast<size_t>(w) * hgt);
+    img.rgba.resize(static_cast<size_t>(w) * hgt * 4);
+    img.bgra.resize(img.rgba.size());
+    for (size_t i = 0; i < static_cast<size_t>(w) * hgt; ++i) {
+        const uint8_t* p = &img.rgb[3 * i];
+        const uint8_t rgba[4] = {p[0], p[1], p[2], 255}, bgra[4] = {p[2], p[1], p[0], 255};
+        std::memcpy(&img.rgba[4 * i], rgba, 4);
+        std::memcpy(&img.bgra[4 * i], bgra, 4);
+    }
     img.yuv.resize(static_cast<size_t>(w) * hgt + 2 * static_cast<size_t>(cw) * ch);
     uint8_t* u = img.yuv.data() + static_cast<size_t>(w) * hgt;
     uint8_t* v = u + static_cast<size_t>(cw) * ch;
@@ -91,13 +103,47 @@ size_t ours(const Image& img, uint32_t format, const void* data, uint32_t qualit
     return static_cast<size_t>(length);
 }
 
+// The same encode through the row-parallel calls, `threads` workers taking
+// rows from a shared counter; to memory, or to `file` when given.
+size_t parallel(const Image& img, uint32_t format, const void* data, uint32_t quality, uint32_t threads,
+                const char* file = nullptr) {
+    ImageInfo info{};
+    info.width = img.width;
+    info.height = img.height;
+    info.data = data;
+    info.format = format;
+    OutputRequest request{EKO_OUTPUT_MEMORY, nullptr, nullptr, 0};
+    if (file != nullptr) request = {EKO_OUTPUT_FILE, DORVATEKO_OsFopen(file, "wb"), nullptr, 0};
+    const EncodeOptions options{quality, nullptr, 0};
+    EkoParallelEncode* e = eko_enc_jpeg_parallel_create(&info, &request, &options, nullptr, nullptr, nullptr, threads);
+    const uint32_t rows = eko_enc_jpeg_parallel_row_count(e);
+    std::atomic<uint32_t> next{0};
+    auto work = [&](uint32_t worker) {
+        for (uint32_t k; (k = next.fetch_add(1)) < rows;) eko_enc_jpeg_parallel_rows(e, worker, k, 1);
+    };
+    std::vector<std::thread> pool;
+    for (uint32_t t = 1; t < threads; ++t) pool.emplace_back(work, t);
+    work(0);
+    for (auto& t : pool) t.join();
+    uint8_t* block = nullptr;
+    uint32_t length = 0;
+    if (eko_enc_jpeg_parallel_finish(e, &block, &length) != 1) {
+        std::fprintf(stderr, "parallel encode failed (error %u)\n", eko_GetLastError());
+        std::exit(1);
+    }
+    if (request.file != nullptr) DORVATEKO_OsFclose(request.file);
+    DORVATEKO_OsFree(block);
+    return length;
+}
+
 size_t turbo(tjhandle h, const Image& img, int mode, int quality) {
     unsigned char* out = nullptr;
     unsigned long size = 0;
     int rc;
-    if (mode == 0) {
-        rc = tjCompress2(h, img.rgb.data(), img.width, 0, img.height, TJPF_RGB, &out, &size, TJSAMP_420, quality,
-                         TJFLAG_FASTDCT);
+    if (mode == 0 || mode >= 3) {
+        const uint8_t* px = mode == 0 ? img.rgb.data() : mode == 3 ? img.rgba.data() : img.bgra.data();
+        rc = tjCompress2(h, px, img.width, 0, img.height, mode == 0 ? TJPF_RGB : mode == 3 ? TJPF_RGBA : TJPF_BGRA, &out,
+                         &size, TJSAMP_420, quality, TJFLAG_FASTDCT);
     } else if (mode == 1) {
         rc = tjCompressFromYUV(h, img.yuv.data(), img.width, 1, img.height, TJSAMP_420, &out, &size, quality,
                                TJFLAG_FASTDCT);
@@ -135,11 +181,27 @@ void reset_peak() {
 
 }  // namespace
 
-int rss_only(const Image& img);
+int rss_only(const Image& img, uint32_t threads, int stack);
+int row_times(const Image& img);
 
 int main(int argc, char** argv) {
-    const bool rss = argc > 1 && std::strcmp(argv[1], "--rss") == 0;
-    if (rss) {
+    bool rss = false, rows = false;
+    uint32_t threads = 1;
+    int stack = 1;
+    for (;;) {
+        if (argc > 1 && std::strcmp(argv[1], "--rss") == 0) {
+            rss = true;
+        } else if (argc > 1 && std::strcmp(argv[1], "--rows") == 0) {
+            rows = true;
+        } else if (argc > 1 && std::strcmp(argv[1], "--tall") == 0) {
+            stack = 2;
+        } else if (argc > 2 && std::strcmp(argv[1], "--threads") == 0) {
+            threads = static_cast<uint32_t>(std::max(1, std::atoi(argv[2])));
+            --argc;
+            ++argv;
+        } else {
+            break;
+        }
         --argc;
         ++argv;
     }
@@ -150,14 +212,17 @@ int main(int argc, char** argv) {
         std::printf("benchmark image %s not found: skipped\n", path.c_str());
         return 0;
     }
-    if (rss) return rss_only(img);
+    if (rss) return rss_only(img, threads, stack);
+    if (rows) return row_times(img);
     derive(img);
     const double mp = img.width * static_cast<double>(img.height) / 1e6;
     const char* simd = std::getenv("JSIMD_FORCENONE");
     std::printf("%s: %dx%d (%.2f MP), best of %d, libjpeg-turbo SIMD %s\n", path.c_str(), img.width, img.height, mp,
                 reps, simd != nullptr && std::strcmp(simd, "1") == 0 ? "off" : "on");
-    std::printf("%-14s %4s %12s %12s %9s %10s %10s\n", "input", "q", "TekoJ MP/s", "turbo MP/s", "ratio", "TekoJ KiB",
+    std::printf("%-14s %4s %12s %12s %9s %10s %10s", "input", "q", "TekoJ MP/s", "turbo MP/s", "ratio", "TekoJ KiB",
                 "turbo KiB");
+    if (threads > 1) std::printf("  x%-2u MP/s  /TekoJ  /turbo", threads);
+    std::printf("\n");
     tjhandle h = tjInitCompress();
     struct Case {
         const char* name;
@@ -166,6 +231,8 @@ int main(int argc, char** argv) {
         int mode;
     };
     const Case cases[] = {{"RGB888 4:2:0", EKO_FORMAT_RGB888, img.rgb.data(), 0},
+                          {"RGBA8888 4:2:0", EKO_FORMAT_RGBA8888, img.rgba.data(), 3},
+                          {"BGRA8888 4:2:0", EKO_FORMAT_BGRA8888, img.bgra.data(), 4},
                           {"YUV 4:2:0", EKO_FORMAT_YUV420, img.yuv.data(), 1},
                           {"grey", EKO_FORMAT_GREY, img.grey.data(), 2}};
     for (const Case& c : cases) {
@@ -173,8 +240,16 @@ int main(int argc, char** argv) {
             size_t ours_bytes = 0, turbo_bytes = 0;
             const double t_ours = best_time(reps, [&] { return ours(img, c.format, c.data, static_cast<uint32_t>(q)); }, ours_bytes);
             const double t_turbo = best_time(reps, [&] { return turbo(h, img, c.mode, q); }, turbo_bytes);
-            std::printf("%-14s %4d %12.1f %12.1f %9.2f %10zu %10zu\n", c.name, q, mp / t_ours, mp / t_turbo,
+            std::printf("%-14s %4d %12.1f %12.1f %9.2f %10zu %10zu", c.name, q, mp / t_ours, mp / t_turbo,
                         t_turbo / t_ours, ours_bytes / 1024, turbo_bytes / 1024);
+            if (threads > 1) {
+                size_t bytes = 0;
+                const double t = best_time(
+                    reps, [&] { return parallel(img, c.format, c.data, static_cast<uint32_t>(q), threads); }, bytes);
+                if (bytes != ours_bytes) std::printf("  (size differs!)");
+                std::printf("  %9.1f %7.2f %7.2f", mp / t, t_ours / t, t_turbo / t);
+            }
+            std::printf("\n");
         }
     }
     tjDestroy(h);
@@ -182,21 +257,91 @@ int main(int argc, char** argv) {
     return 0;
 }
 
-int rss_only(const Image& img) {
+int rss_only(const Image& img, uint32_t threads, int stack) {
     // Memory for file output is bounded by the width: what an encode adds to
-    // the peak resident set, beyond the caller's own pixels.
-    const long before = status_kib("VmRSS:");
-    reset_peak();
+    // the peak resident set, beyond the caller's own pixels (`stack` copies
+    // of the image one above the other show that height adds nothing).
+    const char* out = "/tmp/tekoj_bench_out.jpg";
+    {
+        Image tall = img;
+        tall.height = img.height * stack;
+        for (int k = 1; k < stack; ++k) tall.rgb.insert(tall.rgb.end(), img.rgb.begin(), img.rgb.end());
+        ImageInfo info{};
+        info.width = tall.width;
+        info.height = tall.height;
+        info.data = tall.rgb.data();
+        info.format = EKO_FORMAT_RGB888;
+        const long before = status_kib("VmRSS:");
+        reset_peak();
+        if (threads > 1) {
+            parallel(tall, EKO_FORMAT_RGB888, tall.rgb.data(), 75, threads, out);
+        } else if (eko_enc_jpeg_to_file(&info, out, 75) != 1) {
+            return 1;
+        }
+        std::remove(out);
+        const long peak = status_kib("VmHWM:");
+        std::printf("peak resident memory added by a %dx%d RGB encode to a file, %u thread(s): %ld KiB (resident "
+                    "before %ld KiB)\n",
+                    tall.width, tall.height, threads, peak - before, before);
+    }
+    return 0;
+}
+
+// Coding time of each MCU row (one worker, to memory), their spread, and the
+// speedup that P workers taking rows in order can reach when a row may run
+// at most a window of 2P rows ahead of the first row not yet handed on.
+int row_times(const Image& img) {
     ImageInfo info{};
     info.width = img.width;
     info.height = img.height;
     info.data = img.rgb.data();
     info.format = EKO_FORMAT_RGB888;
-    const char* out = "/tmp/tekoj_bench_out.jpg";
-    if (eko_enc_jpeg_to_file(&info, out, 75) != 1) return 1;
-    std::remove(out);
-    const long peak = status_kib("VmHWM:");
-    std::printf("peak resident memory added by a %dx%d RGB encode to a file: %ld KiB (resident before %ld KiB)\n",
-                img.width, img.height, peak - before, before);
+    std::vector<double> best;
+    for (int rep = 0; rep < 5; ++rep) {
+        const OutputRequest request{EKO_OUTPUT_MEMORY, nullptr, nullptr, 0};
+        const EncodeOptions options{75, nullptr, 0};
+        EkoParallelEncode* e = eko_enc_jpeg_parallel_create(&info, &request, &options, nullptr, nullptr, nullptr, 1);
+        const uint32_t rows = eko_enc_jpeg_parallel_row_count(e);
+        best.resize(rows, 1e30);
+        for (uint32_t k = 0; k < rows; ++k) {
+            const auto t0 = Clock::now();
+            eko_enc_jpeg_parallel_rows(e, 0, k, 1);
+            best[k] = std::min(best[k], std::chrono::duration<double>(Clock::now() - t0).count());
+        }
+        uint8_t* block = nullptr;
+        uint32_t length = 0;
+        eko_enc_jpeg_parallel_finish(e, &block, &length);
+        DORVATEKO_OsFree(block);
+    }
+    std::vector<double> sorted = best;
+    std::sort(sorted.begin(), sorted.end());
+    double sum = 0;
+    for (double t : best) sum += t;
+    const size_t n = sorted.size();
+    std::printf("%zu rows (RGB888 q75), ms per row: min %.3f  median %.3f  p90 %.3f  max %.3f  mean %.3f\n", n,
+                sorted[0] * 1e3, sorted[n / 2] * 1e3, sorted[n * 9 / 10] * 1e3, sorted[n - 1] * 1e3, sum / n * 1e3);
+    for (uint32_t p : {2u, 4u, 8u}) {
+        for (uint32_t depth : {2u, 4u}) {
+            // Each worker, when free, takes the next row if that row is within
+            // the window; rows are handed on in order as soon as they are done.
+            const uint32_t window = p * depth;
+            std::vector<double> free_at(p, 0.0), done(n, 0.0);
+            double handed_at = 0;  // time at which the rows before `handed` were all done
+            size_t handed = 0;
+            for (size_t k = 0; k < n; ++k) {
+                const size_t w = std::min_element(free_at.begin(), free_at.end()) - free_at.begin();
+                double start = free_at[w];
+                if (k >= window) {
+                    while (handed <= k - window) handed_at = std::max(handed_at, done[handed++]);
+                    start = std::max(start, handed_at);
+                }
+                done[k] = start + best[k];
+                free_at[w] = done[k];
+            }
+            const double span = *std::max_element(done.begin(), done.end());
+            std::printf("  %u workers, window %2u: speedup %.2f (ideal %.2f)\n", p, window, sum / span,
+                        std::min<double>(p, sum / sorted[n - 1]));
+        }
+    }
     return 0;
 }

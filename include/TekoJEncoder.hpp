@@ -25,17 +25,22 @@
 
 #include <algorithm>
 #include <array>
+#include <atomic>
+#include <condition_variable>
 #include <cstddef>
 #include <cstdint>
 #include <cstdio>
 #include <exception>
 #include <filesystem>
+#include <functional>
 #include <memory>
+#include <mutex>
 #include <new>
 #include <optional>
 #include <stdexcept>
 #include <string>
 #include <string_view>
+#include <thread>
 #include <tuple>
 #include <type_traits>
 #include <utility>
@@ -450,11 +455,120 @@ inline void fill_exif(const Exif& e, ExifRecords& out) {
     }
 }
 
+}  // namespace detail
+
+// Runs each job it is given on some thread, in any order, and may return
+// before they finish (a thread pool's submit). Parallel encodes wait for
+// their jobs themselves.
+using Executor = std::function<void(std::function<void()> job)>;
+
+namespace detail {
+
+// The library reads C formats from the caller's memory itself when their
+// rows (and i420 planes) lie exactly as its format codes describe.
+inline bool library_reads_directly(const ImageView& v) {
+    const size_t w = static_cast<size_t>(v.width), h = static_cast<size_t>(v.height);
+    const size_t cw = (w + 1) / 2, ch = (h + 1) / 2;
+    switch (v.format) {
+        case PixelFormat::rgb565:
+        case PixelFormat::rgb888:
+        case PixelFormat::rgba8888:
+        case PixelFormat::bgra8888:
+        case PixelFormat::grey: return v.stride[0] == ImageView::row_bytes(v.format, v.width);
+        case PixelFormat::i420:
+            return v.stride[0] == w && v.stride[1] == cw && v.stride[2] == cw && v.plane[1] == v.plane[0] + w * h &&
+                   v.plane[2] == v.plane[1] + cw * ch;
+        default: return false;
+    }
+}
+
+// Codes every MCU row of `encode`: the calling thread and up to `threads` - 1
+// more (std::threads, or jobs handed to `executor`) take rows in order from a
+// shared counter, so that a row waits only for rows being coded.
+inline void run_rows(EkoParallelEncode* encode, uint32_t threads, const Executor* executor) {
+    const uint32_t rows = eko_enc_jpeg_parallel_row_count(encode);
+    std::atomic<uint32_t> next{0};
+    auto work = [encode, rows, &next](uint32_t worker) {
+        for (uint32_t row; (row = next.fetch_add(1)) < rows;)
+            if (eko_enc_jpeg_parallel_rows(encode, worker, row, 1) != 1) break;
+    };
+    const uint32_t helpers = std::min(threads, rows) - 1;
+    std::mutex lock;
+    std::condition_variable finished;
+    uint32_t running = 0;
+    std::vector<std::thread> pool;
+    for (uint32_t w = 1; w <= helpers; ++w) {
+        // A helper that cannot be started leaves its rows to the others.
+        try {
+            if (executor == nullptr || !*executor) {
+                pool.emplace_back(work, w);
+                continue;
+            }
+            {
+                std::lock_guard<std::mutex> g(lock);
+                ++running;
+            }
+            (*executor)([&, w] {
+                work(w);
+                std::lock_guard<std::mutex> g(lock);
+                if (--running == 0) finished.notify_one();
+            });
+        } catch (...) {
+            if (executor != nullptr && *executor) {
+                std::lock_guard<std::mutex> g(lock);
+                --running;
+            }
+        }
+    }
+    work(0);
+    for (auto& t : pool) t.join();
+    std::unique_lock<std::mutex> g(lock);
+    finished.wait(g, [&] { return running == 0; });
+}
+
+// Codes `v` with several threads through the row-parallel calls; the same
+// results as encode_view.
+inline uint32_t encode_parallel(const ImageView& v, uint32_t quality, const ExifInfo* exif, SinkState& state,
+                                unsigned threads, const Executor* executor) noexcept {
+    try {
+        ImageInfo info{};
+        info.width = v.width;
+        info.height = v.height;
+        info.data = v.plane[0];
+        info.format = library_format(v.format);
+        info.exif_info = exif;
+        const EncodeOptions options{quality, nullptr, 0};
+        const OutputRequest request{EKO_OUTPUT_STREAM, nullptr, nullptr, 0};
+        const unsigned cores = threads != 0 ? threads : std::max(1u, std::thread::hardware_concurrency());
+        const uint32_t workers = std::min(cores, 64u);
+        eko_SetError(EKO_OK);
+        EkoParallelEncode* encode =
+            eko_enc_jpeg_parallel_create(&info, &request, &options, nullptr, &sink_trampoline, &state, workers);
+        if (encode == nullptr) {
+            const uint32_t code = eko_GetLastError();
+            return code != EKO_OK ? code : static_cast<uint32_t>(EKO_ERR_ARGUMENT);
+        }
+        run_rows(encode, workers, executor);
+        const bool ok = eko_enc_jpeg_parallel_finish(encode, nullptr, nullptr) == 1;
+        if (state.failed) return EKO_ERR_WRITE;
+        if (ok) return EKO_OK;
+        const uint32_t code = eko_GetLastError();
+        return code != EKO_OK ? code : static_cast<uint32_t>(EKO_ERR_STATE);
+    } catch (const std::bad_alloc&) {
+        return EKO_ERR_ALLOC;
+    }
+}
+
 // Codes `v` band by band into the sink. Returns the error code; sink
 // failures show as EKO_ERR_WRITE with the sink's exception in `state`.
-inline uint32_t encode_view(const ImageView& v, uint32_t quality, const ExifInfo* exif, SinkState& state) noexcept {
+// With `threads` other than 1 (0: one per core) a view the library can read
+// directly is coded by several threads into the same bytes.
+inline uint32_t encode_view(const ImageView& v, uint32_t quality, const ExifInfo* exif, SinkState& state,
+                            unsigned threads = 1, const Executor* executor = nullptr) noexcept {
     try {
         if (const uint32_t bad = check_view(v); bad != EKO_OK) return bad;
+        if (threads != 1 && library_reads_directly(v))
+            return encode_parallel(v, quality, exif, state, threads, executor);
         const uint32_t band_rows = v.format == PixelFormat::grey ? 8 : 16;
         BandCopier band(v, band_rows);
         ImageInfo info{};
@@ -627,6 +741,15 @@ public:
         thumbnail_.reset();
         return *this;
     }
+    // Threads per encode (0: one per core), started as std::threads or handed
+    // to `executor`. Views whose pixels the library reads in place (the C
+    // formats with tight rows) are coded by rows in parallel, to the same
+    // bytes; other views are coded on the calling thread.
+    Encoder& threads(unsigned count, Executor executor = {}) {
+        threads_ = count;
+        executor_ = std::move(executor);
+        return *this;
+    }
 
     // Throwing members.
     std::vector<uint8_t> encode(const ImageView& view) const {
@@ -692,7 +815,7 @@ public:
 private:
     uint32_t run(const ImageView& view, detail::SinkState& state) const noexcept {
         if (const uint32_t bad = detail::check_view(view); bad != EKO_OK) return bad;
-        if (!exif_ && !thumbnail_) return detail::encode_view(view, quality_, nullptr, state);
+        if (!exif_ && !thumbnail_) return detail::encode_view(view, quality_, nullptr, state, threads_, &executor_);
         try {
             detail::ExifRecords records;
             detail::fill_exif(exif_ ? *exif_ : empty_exif(), records);
@@ -721,7 +844,7 @@ private:
                 x.thumb_data = thumb.data();
                 x.thumb_x_resolution = x.thumb_y_resolution = ExifRational{72, 1};
             }
-            return detail::encode_view(view, quality_, &records.info, state);
+            return detail::encode_view(view, quality_, &records.info, state, threads_, &executor_);
         } catch (const std::bad_alloc&) {
             return EKO_ERR_ALLOC;
         }
@@ -733,6 +856,8 @@ private:
     }
 
     uint32_t quality_ = 85;
+    unsigned threads_ = 1;
+    Executor executor_;
     std::optional<Exif> exif_;
     std::optional<Thumbnail> thumbnail_;
 };

@@ -3,7 +3,8 @@
 # NEON forced on, counted under qemu-arm (../shared/tools/arm-icount): each
 # case runs with 1 and 3 repetitions and half the difference is one encode.
 #
-#   scripts/arm-icount-bench.sh [quick]     quick: RGB888, YUV 4:2:0, grey only
+#   scripts/arm-icount-bench.sh [quick|parallel]     quick: RGB888, YUV 4:2:0, grey only;
+#                                                    parallel: the row-parallel calls' overhead
 # Environment: TEKOJ_SIMD forces our level (portable, neon); BUILD_DIR.
 # Skips (status 0) where the cross tool chain, qemu-arm or armhf TurboJPEG is absent.
 set -eu
@@ -40,24 +41,33 @@ per_pixel() {  # who env format q -> instructions per pixel of one encode
 
 OURS_ENV=""
 [ -n "${TEKOJ_SIMD:-}" ] && OURS_ENV="TEKOJ_SIMD=$TEKOJ_SIMD"
+# Rows of ours against OTHER at qualities 75 and 90, with EXPR of a (ours)
+# and b (other) as the last column.
+compare() {  # other other_env expr format...
+  other=$1 other_env=$2 expr=$3
+  shift 3
+  for fmt in "$@"; do
+    for q in 75 90; do
+      o=$(per_pixel ours "$OURS_ENV" $fmt $q)
+      t=$(per_pixel "$other" "$other_env" $fmt $q)
+      printf '%-11s %3s %8s %8s %8s\n' $fmt $q "$o" "$t" "$(awk -v a="$o" -v b="$t" "BEGIN { printf \"%.2f\", $expr }")"
+    done
+  done
+}
+
+if [ "${1:-}" = parallel ]; then
+  # The row-parallel path, driven from one thread, against the whole-image call.
+  echo "ARM instructions per pixel, ${W}x${H} crop, single-threaded call against the row-parallel calls"
+  printf '%-11s %3s %8s %8s %8s\n' input q whole parallel 'extra %'
+  compare parallel "$OURS_ENV" '(b / a - 1) * 100' rgb888 yuv420 grey
+  exit 0
+fi
 echo "ARM instructions per pixel, ${W}x${H} top-left crop of $(basename "$IMAGE"), 4:2:0, fast DCT, to memory"
 echo "ours: TEKOJ_SIMD=${TEKOJ_SIMD:-auto}; libjpeg-turbo: JSIMD_FORCENEON=1"
-printf '%-11s %3s %8s %8s %7s\n' input q ours turbo ratio
-for fmt in rgb888 yuv420 grey; do
-  for q in 75 90; do
-    o=$(per_pixel ours "$OURS_ENV" $fmt $q)
-    t=$(per_pixel turbo "JSIMD_FORCENEON=1" $fmt $q)
-    printf '%-11s %3s %8s %8s %7s\n' $fmt $q "$o" "$t" "$(awk -v a="$o" -v b="$t" 'BEGIN { printf "%.2f", a / b }')"
-  done
-done
+printf '%-11s %3s %8s %8s %8s\n' input q ours turbo ratio
+compare turbo "JSIMD_FORCENEON=1" 'a / b' rgb888 yuv420 grey
 [ "${1:-}" = quick ] && exit 0
-for fmt in rgba8888 bgra8888; do
-  for q in 75 90; do
-    o=$(per_pixel ours "$OURS_ENV" $fmt $q)
-    t=$(per_pixel turbo "JSIMD_FORCENEON=1" $fmt $q)
-    printf '%-11s %3s %8s %8s %7s\n' $fmt $q "$o" "$t" "$(awk -v a="$o" -v b="$t" 'BEGIN { printf "%.2f", a / b }')"
-  done
-done
+compare turbo "JSIMD_FORCENEON=1" 'a / b' rgba8888 bgra8888
 for fmt in rgb565 nv21 packed422 packed422k; do
   for q in 75 90; do
     printf '%-11s %3s %8s %8s %7s\n' $fmt $q "$(per_pixel ours "$OURS_ENV" $fmt $q)" - -

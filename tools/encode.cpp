@@ -10,6 +10,8 @@
 //   I420              planes copied into the band call's buffer
 //   NV21, NV12        the interleaved V/U reader, reading the frame in place
 //   YUYV, UYVY        the packed 4:2:2 readers (4:2:0 or 4:2:2)
+// With several threads, a 4:2:0 or grey frame (or, when asked for, RGB
+// 4:2:0 or grey rows read whole) goes to the row-parallel calls instead.
 // The readers that no format code selects are run here before the library's
 // coding pass, as the band call would run the format's own reader.
 #include "exif.h"
@@ -17,8 +19,10 @@
 #include <TekoJEncoderInternal.h>
 
 #include <algorithm>
+#include <atomic>
 #include <cstdio>
 #include <cstring>
+#include <thread>
 
 namespace tool {
 namespace {
@@ -166,6 +170,36 @@ private:
     StreamState& state_;
 };
 
+// Codes an image that lies whole in memory in the layout of `format` with
+// several threads, each taking the next MCU row from a shared counter.
+void encode_rows_parallel(const uint8_t* data, uint32_t w, uint32_t h, uint32_t format, uint32_t quality,
+                          uint32_t threads, StreamState& state) {
+    ImageInfo image{};
+    image.width = static_cast<int32_t>(w);
+    image.height = static_cast<int32_t>(h);
+    image.data = data;
+    image.format = format;
+    OutputRequest request{};
+    request.kind = EKO_OUTPUT_STREAM;
+    EncodeOptions options{};
+    options.quality = quality;
+    EkoParallelEncode* e = eko_enc_jpeg_parallel_create(&image, &request, &options, nullptr, on_stream, &state, threads);
+    if (e == nullptr) fail(library_error("the encoder refused the image"));
+    const uint32_t rows = eko_enc_jpeg_parallel_row_count(e);
+    std::atomic<uint32_t> next{0};
+    auto work = [&](uint32_t worker) {
+        for (uint32_t k; (k = next.fetch_add(1)) < rows;)
+            if (eko_enc_jpeg_parallel_rows(e, worker, k, 1) == 0) break;
+    };
+    std::vector<std::thread> pool;
+    for (uint32_t t = 1; t < std::min(threads, rows); ++t) pool.emplace_back(work, t);
+    work(0);
+    for (auto& t : pool) t.join();
+    const bool ok = eko_enc_jpeg_parallel_finish(e, nullptr, nullptr) == 1;
+    if (state.failed) throw Failure(state.file, state.message);
+    if (!ok) fail(library_error("cannot code the image"));
+}
+
 }  // namespace
 
 Summary encode(Source& src, const Options& o, Output& out, const std::function<void(double)>& progress) {
@@ -224,6 +258,27 @@ Summary encode(Source& src, const Options& o, Output& out, const std::function<v
     } else {
         splicer = std::make_unique<Splicer>(out, exif.segment());
         state.write = [&splicer](const uint8_t* p, size_t n) { splicer->put(p, n); };
+    }
+
+    // Several threads when the library can read the whole image in place: a
+    // 4:2:0 or grey frame as it is, RGB 4:2:0 or grey rows once read whole
+    // (only when asked for, since memory then follows the image's area).
+    const bool frame_fits = is_frame(layout) && (summary.grey || layout == Layout::I420);
+    const bool rows_fit = o.threads_given && ((format == EKO_FORMAT_RGB888 && layout == Layout::Rgb) ||
+                                              (summary.grey && layout == Layout::Grey));
+    const uint32_t threads = o.threads != 0 ? o.threads : std::max(1u, std::thread::hardware_concurrency());
+    if (threads > 1 && !thumbnail && (frame_fits || rows_fit)) {
+        std::vector<uint8_t> whole;
+        if (rows_fit) {
+            whole.resize(size_t{row_bytes(layout, w)} * h);
+            for (uint32_t top = 0; top < h; top += band_rows)
+                src.read_rows(whole.data() + size_t{row_bytes(layout, w)} * top, std::min(band_rows, h - top));
+        }
+        encode_rows_parallel(rows_fit ? whole.data() : fy, w, h, summary.grey ? EKO_FORMAT_GREY : format, o.quality,
+                             std::min(threads, 64u), state);
+        progress(1.0);
+        splicer->finish();
+        return summary;
     }
 
     ImageInfo image{};

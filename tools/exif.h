@@ -6,11 +6,7 @@
 
 // The tool also drives exported internal steps: the readers that no format
 // code selects, and the coding pass that follows them.
-#if __has_include(<TekoJEncoderInternal.h>)
 #include <TekoJEncoderInternal.h>
-#else
-#include <TekoJEncoder.h>
-#endif
 
 namespace tool {
 

@@ -11,10 +11,6 @@
 #include <set>
 #include <unistd.h>
 
-#ifndef TEKOJ_TOOL_VERSION
-#define TEKOJ_TOOL_VERSION "unknown"
-#endif
-
 namespace {
 
 using namespace tool;
@@ -56,6 +52,11 @@ const char* const kHelp =
     "                           altitude in metres\n"
     "      --thumbnail          a copy down-scaled to at most 160x120\n"
     "\n"
+    "      --threads N          threads per image, 1 to 64 (default: one per core\n"
+    "                           for Y4M and raw YUV 4:2:0 and grey frames, one\n"
+    "                           otherwise); with N above 1, RGB 4:2:0 and grey\n"
+    "                           row inputs are read whole first. Same bytes for\n"
+    "                           every N. Not with --thumbnail\n"
     "      --sample OUTPUT      encode the built-in 1024x768 sample image\n"
     "  -h, --help               show this help\n"
     "      --version            show the library version\n"
@@ -189,6 +190,8 @@ Arguments parse(int argc, char** argv) {
             if (e.has_altitude) e.altitude = parse_real("--gps altitude", parts[2], 100000);
         } else if (arg == "--thumbnail") {
             flag(), e.thumbnail = true;
+        } else if (arg == "--threads") {
+            e.threads = parse_number(arg, take(), 1, 64), e.threads_given = true;
         } else if (arg == "--sample") {
             a.sample = take();
         } else {
@@ -292,12 +295,8 @@ int main(int argc, char** argv) {
         return std::fflush(stdout) == 0 ? 0 : 1;
     }
     if (a.version) {
-#ifdef TEKOJ_VERSION_MAJOR
         const uint32_t v = eko_GetVersion();
         std::printf("tekoj (libTekoJEncoder) %u.%u.%u\n", v / 10000, v / 100 % 100, v % 100);
-#else
-        std::printf("tekoj (libTekoJEncoder) %s\n", TEKOJ_TOOL_VERSION);
-#endif
         return std::fflush(stdout) == 0 ? 0 : 1;
     }
 

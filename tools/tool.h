@@ -139,6 +139,8 @@ struct Options {
     double latitude = 0, longitude = 0, altitude = 0;
     bool has_altitude = false;
     bool thumbnail = false;
+    uint32_t threads = 0;         // 0: one per core
+    bool threads_given = false;   // --threads was given
 };
 
 struct Summary {

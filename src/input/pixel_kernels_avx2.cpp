@@ -12,10 +12,6 @@
 namespace tekoj {
 namespace {
 
-constexpr int32_t pair(int32_t low, int32_t high) {
-    return static_cast<int32_t>((static_cast<uint32_t>(low) & 0xFFFF) | (static_cast<uint32_t>(high) << 16));
-}
-
 struct Dot {
     __m256i w02, w1;
 };
@@ -26,7 +22,7 @@ struct Weights {
 
 Weights weights_for(bool bgr) {
     auto dot = [bgr](int32_t wr, int32_t wg, int32_t wb) {
-        return Dot{_mm256_set1_epi32(bgr ? pair(wb, wr) : pair(wr, wb)), _mm256_set1_epi32(pair(wg, 0))};
+        return Dot{_mm256_set1_epi32(bgr ? word_pair(wb, wr) : word_pair(wr, wb)), _mm256_set1_epi32(word_pair(wg, 0))};
     };
     return {dot(rgb::kYr, rgb::kYg, rgb::kYb), dot(rgb::kCbR, rgb::kCbG, rgb::kCbB),
             dot(rgb::kCrR, rgb::kCrG, rgb::kCrB)};
@@ -164,7 +160,7 @@ void luma422(const uint8_t* s, uint32_t groups, uint8_t* y) {
 
 // Halving down-scaler: the SSE2 arithmetic on eight groups per step.
 void halve422(const uint8_t* s, uint32_t dw, uint32_t* start, uint32_t* finish) {
-    const __m256i ones = _mm256_set1_epi16(1), uv_weights = _mm256_set1_epi32(pair(2048, 2));
+    const __m256i ones = _mm256_set1_epi16(1), uv_weights = _mm256_set1_epi32(word_pair(2048, 2));
     uint32_t i = 0;
     for (; i + 8 <= dw; i += 8) {
         const __m256i g = _mm256_loadu_si256(reinterpret_cast<const __m256i*>(s + 4 * i));

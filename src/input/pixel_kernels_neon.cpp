@@ -20,40 +20,53 @@ struct Channels {
     uint16x8_t r, g, b;
 };
 
-inline uint16x4_t luma4(uint16x4_t r, uint16x4_t g, uint16x4_t b) {
-    uint32x4_t s = vmull_n_u16(r, rgb::kYr);
-    s = vmlal_n_u16(s, g, rgb::kYg);
-    s = vmlal_n_u16(s, b, rgb::kYb);
-    return vshrn_n_u32(s, 12);
-}
-
-inline uint8x8_t luma8(const Channels& c) {
-    return vmovn_u16(vcombine_u16(luma4(vget_low_u16(c.r), vget_low_u16(c.g), vget_low_u16(c.b)),
-                                  luma4(vget_high_u16(c.r), vget_high_u16(c.g), vget_high_u16(c.b))));
-}
-
-// Bias + 2048 * plus - m1 * minus1 - m2 * minus2: the shape of both chroma
-// sums (Cb: plus B, minus R and G; Cr: plus R, minus G and B).
-template <uint16_t M1, uint16_t M2>
-inline uint16x4_t chroma4(uint16x4_t plus, uint16x4_t minus1, uint16x4_t minus2) {
-    uint32x4_t s = vmlal_n_u16(vdupq_n_u32(rgb::kChromaBias), plus, 2048);
-    s = vmlsl_n_u16(s, minus1, M1);
-    s = vmlsl_n_u16(s, minus2, M2);
-    return vshrn_n_u32(s, 12);
-}
+// The weights as vector lanes, loaded once per row: multiplies by a lane
+// keep GCC from rebuilding a scalar-duplicated constant in every iteration.
+// Lanes of `a`: luma R, G, B and the chroma weight 2048 (Cb of B, Cr of R);
+// lanes of `b`: the subtracted weights, Cb of R and G, Cr of G and B.
+struct Weights {
+    uint16x4_t a, b;
+};
 
 static_assert(rgb::kCbB == 2048 && rgb::kCrR == 2048);
+constexpr uint16_t kWeights[8] = {rgb::kYr, rgb::kYg, rgb::kYb, 2048, -rgb::kCbR, -rgb::kCbG, -rgb::kCrG, -rgb::kCrB};
 
-inline uint8x8_t cb8(const Channels& c) {
-    constexpr uint16_t r = -rgb::kCbR, g = -rgb::kCbG;
-    return vmovn_u16(vcombine_u16(chroma4<r, g>(vget_low_u16(c.b), vget_low_u16(c.r), vget_low_u16(c.g)),
-                                  chroma4<r, g>(vget_high_u16(c.b), vget_high_u16(c.r), vget_high_u16(c.g))));
+inline Weights weights() { return {vld1_u16(kWeights), vld1_u16(kWeights + 4)}; }
+
+inline uint16x4_t luma4(uint16x4_t r, uint16x4_t g, uint16x4_t b, const Weights& w) {
+    uint32x4_t s = vmull_lane_u16(r, w.a, 0);
+    s = vmlal_lane_u16(s, g, w.a, 1);
+    s = vmlal_lane_u16(s, b, w.a, 2);
+    return vshrn_n_u32(s, 12);
 }
 
-inline uint8x8_t cr8(const Channels& c) {
-    constexpr uint16_t g = -rgb::kCrG, b = -rgb::kCrB;
-    return vmovn_u16(vcombine_u16(chroma4<g, b>(vget_low_u16(c.r), vget_low_u16(c.g), vget_low_u16(c.b)),
-                                  chroma4<g, b>(vget_high_u16(c.r), vget_high_u16(c.g), vget_high_u16(c.b))));
+inline uint8x8_t luma8(const Channels& c, const Weights& w) {
+    return vmovn_u16(vcombine_u16(luma4(vget_low_u16(c.r), vget_low_u16(c.g), vget_low_u16(c.b), w),
+                                  luma4(vget_high_u16(c.r), vget_high_u16(c.g), vget_high_u16(c.b), w)));
+}
+
+inline uint16x4_t cb4(uint16x4_t r, uint16x4_t g, uint16x4_t b, const Weights& w) {
+    uint32x4_t s = vmlal_lane_u16(vdupq_n_u32(rgb::kChromaBias), b, w.a, 3);
+    s = vmlsl_lane_u16(s, r, w.b, 0);
+    s = vmlsl_lane_u16(s, g, w.b, 1);
+    return vshrn_n_u32(s, 12);
+}
+
+inline uint16x4_t cr4(uint16x4_t r, uint16x4_t g, uint16x4_t b, const Weights& w) {
+    uint32x4_t s = vmlal_lane_u16(vdupq_n_u32(rgb::kChromaBias), r, w.a, 3);
+    s = vmlsl_lane_u16(s, g, w.b, 2);
+    s = vmlsl_lane_u16(s, b, w.b, 3);
+    return vshrn_n_u32(s, 12);
+}
+
+inline uint8x8_t cb8(const Channels& c, const Weights& w) {
+    return vmovn_u16(vcombine_u16(cb4(vget_low_u16(c.r), vget_low_u16(c.g), vget_low_u16(c.b), w),
+                                  cb4(vget_high_u16(c.r), vget_high_u16(c.g), vget_high_u16(c.b), w)));
+}
+
+inline uint8x8_t cr8(const Channels& c, const Weights& w) {
+    return vmovn_u16(vcombine_u16(cr4(vget_low_u16(c.r), vget_low_u16(c.g), vget_low_u16(c.b), w),
+                                  cr4(vget_high_u16(c.r), vget_high_u16(c.g), vget_high_u16(c.b), w)));
 }
 
 // Sixteen pixels' channels, even pixels and odd pixels apart.
@@ -79,22 +92,24 @@ inline EvenOdd load16(const uint8_t* p) {
 
 template <int Bpp, bool Bgr, PickLayout Layout>
 void pick_upper(const uint8_t* src, uint32_t w, uint8_t* y, uint8_t* cb, uint8_t* cr) {
+    const Weights wt = weights();
     uint32_t x = 0;
     for (; x + 16 <= w; x += 16) {
         const EvenOdd px = load16<Bpp, Bgr>(src + static_cast<size_t>(x) * Bpp);
-        vst2_u8(y + x, (uint8x8x2_t{{luma8(px.even), luma8(px.odd)}}));
-        vst1_u8(cb + x / 2, cb8(px.even));
-        vst1_u8(cr + x / 2, cr8(px.even));
+        vst1_u8(cb + x / 2, cb8(px.even, wt));
+        vst1_u8(cr + x / 2, cr8(px.even, wt));
+        vst2_u8(y + x, (uint8x8x2_t{{luma8(px.even, wt), luma8(px.odd, wt)}}));
     }
     kPortableInputKernels.pick_upper[Layout](src + static_cast<size_t>(x) * Bpp, w - x, y + x, cb + x / 2, cr + x / 2);
 }
 
 template <int Bpp, bool Bgr, PickLayout Layout>
 void pick_lower(const uint8_t* src, uint32_t w, uint8_t* y) {
+    const Weights wt = weights();
     uint32_t x = 0;
     for (; x + 16 <= w; x += 16) {
         const EvenOdd px = load16<Bpp, Bgr>(src + static_cast<size_t>(x) * Bpp);
-        vst2_u8(y + x, (uint8x8x2_t{{luma8(px.even), luma8(px.odd)}}));
+        vst2_u8(y + x, (uint8x8x2_t{{luma8(px.even, wt), luma8(px.odd, wt)}}));
     }
     kPortableInputKernels.pick_lower[Layout](src + static_cast<size_t>(x) * Bpp, w - x, y + x);
 }
@@ -108,6 +123,7 @@ inline Channels expand565(uint16x8_t p) {
 
 void rgb565_blocks(const uint8_t* upper, const uint8_t* lower, uint32_t blocks, uint8_t* y0, uint8_t* y1, uint8_t* cb,
                    uint8_t* cr) {
+    const Weights wt = weights();
     uint32_t k = 0;
     for (; k + 8 <= blocks; k += 8) {
         // Even and odd pixels of 16-pixel runs of both rows.
@@ -115,15 +131,15 @@ void rgb565_blocks(const uint8_t* upper, const uint8_t* lower, uint32_t blocks, 
         const uint16x8x2_t l = vld2q_u16(reinterpret_cast<const uint16_t*>(lower + 4 * k));
         const Channels ue = expand565(u.val[0]), uo = expand565(u.val[1]);
         const Channels le = expand565(l.val[0]), lo = expand565(l.val[1]);
-        vst2_u8(y0 + 2 * k, (uint8x8x2_t{{luma8(ue), luma8(uo)}}));
-        vst2_u8(y1 + 2 * k, (uint8x8x2_t{{luma8(le), luma8(lo)}}));
+        vst2_u8(y0 + 2 * k, (uint8x8x2_t{{luma8(ue, wt), luma8(uo, wt)}}));
+        vst2_u8(y1 + 2 * k, (uint8x8x2_t{{luma8(le, wt), luma8(lo, wt)}}));
         // Green alone gets the rounding term of the average.
         const Channels avg{
             vshrq_n_u16(vaddq_u16(vaddq_u16(ue.r, uo.r), vaddq_u16(le.r, lo.r)), 2),
             vshrq_n_u16(vaddq_u16(vaddq_u16(vaddq_u16(ue.g, uo.g), vaddq_u16(le.g, lo.g)), vdupq_n_u16(2)), 2),
             vshrq_n_u16(vaddq_u16(vaddq_u16(ue.b, uo.b), vaddq_u16(le.b, lo.b)), 2)};
-        vst1_u8(cb + k, cb8(avg));
-        vst1_u8(cr + k, cr8(avg));
+        vst1_u8(cb + k, cb8(avg, wt));
+        vst1_u8(cr + k, cr8(avg, wt));
     }
     kPortableInputKernels.rgb565_blocks(upper + 4 * k, lower + 4 * k, blocks - k, y0 + 2 * k, y1 + 2 * k, cb + k,
                                         cr + k);

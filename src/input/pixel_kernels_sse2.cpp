@@ -17,10 +17,6 @@
 namespace tekoj {
 namespace {
 
-constexpr int32_t pair(int32_t low, int32_t high) {
-    return static_cast<int32_t>((static_cast<uint32_t>(low) & 0xFFFF) | (static_cast<uint32_t>(high) << 16));
-}
-
 // pmaddwd weights of one output for pixel bytes (c0, c2) and (c1, c3).
 struct Dot {
     __m128i w02, w1;
@@ -34,7 +30,7 @@ struct Weights {
 
 Weights weights_for(bool bgr) {
     auto dot = [bgr](int32_t wr, int32_t wg, int32_t wb) {
-        return Dot{_mm_set1_epi32(bgr ? pair(wb, wr) : pair(wr, wb)), _mm_set1_epi32(pair(wg, 0))};
+        return Dot{_mm_set1_epi32(bgr ? word_pair(wb, wr) : word_pair(wr, wb)), _mm_set1_epi32(word_pair(wg, 0))};
     };
     return {dot(rgb::kYr, rgb::kYg, rgb::kYb), dot(rgb::kCbR, rgb::kCbG, rgb::kCbB),
             dot(rgb::kCrR, rgb::kCrG, rgb::kCrB)};
@@ -217,7 +213,7 @@ void luma422(const uint8_t* s, uint32_t groups, uint8_t* y) {
 // group add by pmaddwd with (1, 1); (U, V) weighted (2048, 2) give 2U << 10
 // plus 2V.
 void halve422(const uint8_t* s, uint32_t dw, uint32_t* start, uint32_t* finish) {
-    const __m128i ones = _mm_set1_epi16(1), uv_weights = _mm_set1_epi32(pair(2048, 2));
+    const __m128i ones = _mm_set1_epi16(1), uv_weights = _mm_set1_epi32(word_pair(2048, 2));
     uint32_t i = 0;
     for (; i + 4 <= dw; i += 4) {
         const __m128i g = _mm_loadu_si128(reinterpret_cast<const __m128i*>(s + 4 * i));

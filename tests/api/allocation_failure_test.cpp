@@ -12,7 +12,6 @@
 
 #include <gtest/gtest.h>
 
-#include <cctype>
 #include <filesystem>
 #include <iostream>
 #include <string>
@@ -40,18 +39,6 @@ struct NoLeak {
 Bytes noise(size_t n, uint32_t seed) {
     Bytes b(n);
     for (auto& v : b) v = static_cast<uint8_t>((seed = seed * 1664525u + 1013904223u) >> 24);
-    return b;
-}
-
-// The stream with its DateTime text ("YYYY:MM:DD HH:MM:SS") blanked: the
-// clock may tick between two encodes.
-Bytes without_date(Bytes b) {
-    static const char kPattern[] = "dddd:dd:dd dd:dd:dd";
-    for (size_t i = 0; i + 19 <= b.size(); ++i) {
-        size_t k = 0;
-        while (k < 19 && (kPattern[k] == 'd' ? std::isdigit(b[i + k]) != 0 : b[i + k] == uint8_t(kPattern[k]))) ++k;
-        if (k == 19) std::fill(b.begin() + long(i), b.begin() + long(i + 19), uint8_t('#'));
-    }
     return b;
 }
 

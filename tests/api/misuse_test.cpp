@@ -233,6 +233,13 @@ TEST(Creation, SettingsForOneComponentOrWithoutDriAreFollowed) {
             EXPECT_EQ(jpeg, reference);
         }
     }
+    // Four tables, the chroma components naming tables 2 and 3.
+    s = settings_420();
+    s.num_quant_tables = 4, s.component_specs[1][0] = 2, s.component_specs[2][0] = 3;
+    std::memcpy(s.quant_tables[2], eko_chrominanceQuantTbl[3], 64);
+    std::memcpy(s.quant_tables[3], eko_chrominanceQuantTbl[6], 64);
+    const Bytes four = encode_with_settings(image_info(yuv.data(), 37, 48, EKO_FORMAT_YUV420), &s);
+    EXPECT_TRUE(decode_jpeg(four).ok && !decode_jpeg(four).warning && find_marker(four, 0xDB) < four.size());
     // write_dri 0: neither a DRI segment nor restart markers.
     const ImageInfo colour = image_info(yuv.data(), 37, 48, EKO_FORMAT_YUV420);
     s = settings_420();

@@ -79,6 +79,21 @@ TEST(MemoryTarget, GrowsBy4096ThenGeometricallyKeepingTheBytesWritten) {
     DORVATEKO_OsFree(t->buffer);
     __eko_jpeg_enc_release_mem(ctx);
     DORVATEKO_OsFree(ctx);
+    // Completion makes its own room for the pad byte, its stuffing and EOI,
+    // whatever room the coding left.
+    const Bytes small = noise(image_size(EKO_FORMAT_GREY, 8, 8), 5);
+    const ImageInfo tiny = image_info(small.data(), 8, 8, EKO_FORMAT_GREY);
+    for (uint32_t room = 0; room <= 12; ++room) {
+        const OutputRequest none{EKO_OUTPUT_MEMORY, nullptr, nullptr, 0};
+        EncoderContext* c = __eko_jpeg_enc_initiaize(&tiny, &none, &options, nullptr);
+        ASSERT_TRUE(c != nullptr && __eko_jpeg_enc_make_header(c) == 1 && __eko_jpeg_enc_process_image_data(c) == 1);
+        c->output->capacity = c->output->used + room;  // the block is larger; only the bookkeeping says less
+        EXPECT_TRUE(__eko_jpeg_enc_make_end_mark(c) == 1 && c->output->used <= c->output->capacity) << room;
+        EXPECT_EQ(Bytes(c->output->buffer, c->output->buffer + c->output->total), encode_to_memory(tiny, 100)) << room;
+        DORVATEKO_OsFree(c->output->buffer);
+        __eko_jpeg_enc_release_mem(c);
+        DORVATEKO_OsFree(c);
+    }
     ASSERT_GE(capacities.size(), 5u);
     EXPECT_TRUE(capacities[0] == 2048 && capacities[1] == 6144);  // the first growth adds 4096
     for (size_t i = 1; i < capacities.size(); ++i)

@@ -1,7 +1,7 @@
 // Row-parallel encoding: for every format, size, thread count and output
 // kind the stream equals the single-threaded one; the callback gets it in
 // order, one call at a time; failures anywhere leak nothing.
-#include <TekoJEncoder.h>
+#include <TekoJEncoder.hpp>
 
 #include "incremental/incremental_support.h"
 #include "support/fault_os_layer.h"
@@ -187,4 +187,23 @@ TEST(Parallel, MisuseIsRefusedAndFailuresLeakNothing) {
     EXPECT_TRUE(parallel(noisy, EKO_OUTPUT_FILE, 3, 95).empty());
     fail_writes_after(-1);
     EXPECT_EQ(live_blocks(), live);
+}
+
+TEST(Parallel, CppLayerWithThreadsOrAnExecutor) {
+    const Bytes rgb = photo_rgb(90, 70, 6);
+    const tekoj::ImageView view(rgb.data(), 90, 70, tekoj::PixelFormat::rgb888);
+    tekoj::Encoder encoder;
+    encoder.quality(80);
+    const Bytes reference = encoder.encode(view);
+    EXPECT_EQ(reference, encode_to_memory(image_info(rgb.data(), 90, 70, EKO_FORMAT_RGB888), 80));
+    EXPECT_EQ(encoder.threads(3).encode(view), reference);
+    EXPECT_EQ(encoder.threads(0).encode(view), reference);
+    std::vector<std::thread> pool;
+    encoder.threads(4, [&](std::function<void()> job) { pool.emplace_back(std::move(job)); });
+    EXPECT_EQ(encoder.encode(view), reference);
+    for (auto& t : pool) t.join();
+    encoder.threads(2).encode_to_file(view, kPath);
+    EXPECT_EQ(read_file(kPath), reference);
+    // A sink that stops the stream fails the parallel encode too.
+    EXPECT_EQ(encoder.try_encode_to(view, [](const uint8_t*, size_t) { return false; }), uint32_t(EKO_ERR_WRITE));
 }

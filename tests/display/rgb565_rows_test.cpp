@@ -4,6 +4,8 @@
 // luma at the clamping extremes. Buffers have exactly the described size.
 #include "display/rgb565_rows.h"
 
+#include "support/test_support.h"
+
 #include <gtest/gtest.h>
 
 #include <string>
@@ -12,18 +14,8 @@
 namespace {
 
 using namespace tekoj;
-using Bytes = std::vector<uint8_t>;
+using tekoj_test::Bytes;
 using Words = std::vector<uint16_t>;
-
-Bytes random_bytes(size_t n, uint32_t seed) {
-    Bytes b(n);
-    for (auto& v : b) {
-        seed = seed * 1664525u + 1013904223u;
-        const uint32_t pick = seed >> 30;
-        v = pick == 0 ? 0 : pick == 1 ? 255 : static_cast<uint8_t>(seed >> 16);
-    }
-    return b;
-}
 
 // Both rows' output words of one call, for the planar (false) or the
 // interleaved (true) layout; `chroma` holds Cb then Cr planes' rows, or the
@@ -65,7 +57,7 @@ TEST(Rgb565Rows, EveryLevelMatchesTheTables) {
     for (size_t w : {63, 64, 65, 1001, 1921}) widths.push_back(w);
     for (size_t w : widths)
         for (uint32_t seed = 1; seed <= 4; ++seed)
-            expect_levels_match(random_bytes(2 * w, seed + 100 * w), w, random_bytes(w + 1, seed * 31 + w),
+            expect_levels_match(tekoj_test::noise_with_extremes(2 * w, seed + 100 * w), w, tekoj_test::noise_with_extremes(w + 1, seed * 31 + w),
                                 "width " + std::to_string(w));
     // Every (Cb, Cr) pair of the planar layout once, under luma 0, 255 and a ramp.
     Bytes chroma(2 * 65536);

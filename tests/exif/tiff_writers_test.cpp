@@ -25,9 +25,13 @@ TEST(TiffWriters, EachWriterFillsOneEntryAndItsDataArea) {
     check(__eko_WriteRATIONALTag(p, p, &o, 0x011A, 72, 1), "1A01 0500 01000000 26000000", "48000000 01000000");
     // Short values stand inline, zero-padded; short strings also in the data area.
     check(__eko_WriteASCIITag(p, p, &o, 0x010F, "XY"), "0F01 0200 03000000 58590000", "585900");
+    check(__eko_WriteASCIITag(p, p, &o, 0x010F, "XYZ"), "0F01 0200 04000000 58595A00", "58595A00");  // 4 bytes: inline
+    check(__eko_WriteASCIITag(p, p, &o, 0x010F, "WXYZ"), "0F01 0200 05000000 26000000", "5758595A00");
     check(__eko_WriteASCIITag(p, p, &o, 0x0110, "ABCDEFGHI"), "1001 0200 0A000000 26000000", "414243444546474849 00");
     check(__eko_WriteASCIITag(p, p, &o, 0x0110, ""), "1001 0200 01000000 00000000", "00");
     check(__eko_WriteBYTESTag(p, p, &o, 5, bytes, 1), "0500 0100 01000000 07000000", "");
+    check(__eko_WriteBYTESTag(p, p, &o, 5, bytes, 4), "0500 0100 04000000 07010203", "");
+    check(__eko_WriteBYTESTag(p, p, &o, 5, bytes, 5), "0500 0100 05000000 26000000", "07010203 04");
     check(__eko_WriteBYTESTag(p, p, &o, 5, bytes, 6), "0500 0100 06000000 26000000", "07010203 0405");
     check((__eko_WriteUNDEFINEDTag(p, p, &o, 0x1B, bytes, 3), p + 12), "1B00 0700 03000000 07010200", "");
     check((__eko_WriteUNDEFINEDTag(p, p, &o, 0x1B, nullptr, 9), p + 12), "1B00 0700 00000000 00000000", "");

@@ -55,6 +55,11 @@ TEST(McuRows, MisuseIsRefusedAndChangesNothing) {
         EXPECT_TRUE(stage != Stage::Coded || eko_GetLastError() == EKO_ERR_STATE);
     };
     EXPECT_EQ(encode(info, {.hook = hook}), encode_to_memory(info, 75));
+    // A stream target keeps its callback once a band has been handed on.
+    EXPECT_EQ(encode(info, {.sink = EKO_OUTPUT_STREAM, .hook = [&](EncoderContext* ctx, Stage stage) {
+                  EXPECT_TRUE(stage != Stage::Coded || (eko_jpeg_enc_mcu_set_stream(ctx, ignore, nullptr) == 0 &&
+                                                        eko_GetLastError() == EKO_ERR_STATE));
+              }}), encode_to_memory(info, 75));
     eko_jpeg_enc_mcu_finish(nullptr, nullptr, nullptr);
     EXPECT_EQ(live_blocks(), live);
 }
@@ -71,7 +76,9 @@ TEST(RowDriver, UncodableCoefficientsAreRefusedBeforeAnyByte) {
     const Bytes reference = encode(info, {.settings = &s, .mode = Mode::Rows, .coefficients = good});
     ASSERT_FALSE(reference.empty());
     struct Bad { uint32_t mcu, index; int16_t value; };
-    for (const Bad c : {Bad{2, 0, 1048}, {1, 5, 1024}, {3, 0, 2048}}) {
+    // MCU 4 follows MCU 3 in the second row: 1048 is refused after -1000,
+    // though it would pass after the restart that MCU 3 alone follows.
+    for (const Bad c : {Bad{2, 0, 1048}, {1, 5, 1024}, {3, 0, 2048}, {4, 0, 1048}}) {
         for (const bool columns : {false, true}) {
             // Just before the band or column holding the bad MCU is coded, a
             // version with the bad value is handed in: refused, nothing written.
@@ -94,9 +101,11 @@ TEST(RowDriver, UncodableCoefficientsAreRefusedBeforeAnyByte) {
 TEST(ColumnSplit, RefusedWhereTheJoinCouldNotBeValid) {
     FaultScope scope;
     const int64_t live = live_blocks();
-    const Bytes yuv = rgb_to_yuv420(photo_rgb(32, 32), 32, 32);
+    Bytes yuv = rgb_to_yuv420(photo_rgb(32, 32), 32, 32);
     const ImageInfo info = image_info(yuv.data(), 32, 32, EKO_FORMAT_YUV420);
     const EncoderSettings s = settings(), no_dri = settings(0, 0);
+    const OutputRequest memory{EKO_OUTPUT_MEMORY, nullptr, nullptr, 0};
+    const EncodeOptions options{75, nullptr, 0};
     McuBlockList column[2]{};
     uint32_t next = 0;
     // No settings record, no DRI in the header, a band already coded: the
@@ -109,10 +118,18 @@ TEST(ColumnSplit, RefusedWhereTheJoinCouldNotBeValid) {
                                 EXPECT_EQ(__eko_jpeg_enc_col_encoder_finish(ctx), 1u);
                             }}).empty());
     }
-    // Finishing with the mode still set up frees the rows, hands back nothing.
-    EXPECT_TRUE(encode(info, {&s, Mode::Columns, EKO_OUTPUT_MEMORY, {}, [](EncoderContext* ctx, Stage stage) {
-                    if (stage == Stage::BeforeJoin) ctx->col_next_row = 0;  // the join refuses
-                }}).empty());
+    // A column after the last one is refused; finishing with the columns not
+    // joined frees the rows and hands back no stream.
+    std::vector<int16_t> zero(2 * 6 * 64, 0);
+    auto lists = block_lists(zero, 6, 0, 2, 1);
+    EncoderContext* ctx = eko_jpeg_enc_mcu_init(&info, &memory, &options, &s);
+    ASSERT_TRUE(ctx != nullptr && __eko_jpeg_enc_col_encoder_init(ctx) == 1);
+    for (int k = 0; k < 3; ++k) EXPECT_EQ(__eko_jpeg_enc_col_entroy_encoder(ctx, lists.data(), &next), k < 2 ? 1u : 0u);
+    EXPECT_TRUE(next == 32 && eko_GetLastError() == EKO_ERR_STATE);
+    uint8_t* block = yuv.data();
+    uint32_t length = 7;
+    eko_jpeg_enc_mcu_finish(ctx, &block, &length);
+    EXPECT_TRUE(block == nullptr && length == 0 && eko_GetLastError() == EKO_ERR_STATE);
     EXPECT_EQ(__eko_jpeg_enc_col_encoder_init(nullptr) + __eko_jpeg_enc_col_encoder_finish(nullptr), 0u);
     EXPECT_EQ(live_blocks(), live);
 }

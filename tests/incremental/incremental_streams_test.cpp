@@ -4,6 +4,7 @@
 
 #include <gtest/gtest.h>
 
+#include <algorithm>
 #include <cstring>
 
 using namespace tekoj_test;
@@ -21,6 +22,21 @@ TEST(McuRows, BandsAndRowDriverGiveTheWholeImageStream) {
         const Decoded d = decode_jpeg(whole);
         EXPECT_TRUE(d.ok && !d.warning) << d.message;
         for (const uint32_t sink : kSinks) EXPECT_EQ(encode(info, {.sink = sink}), whole);
+        // What a memory target holds so far is always a prefix of the stream:
+        // the header alone right after init.
+        const uint8_t sos_marker[2] = {0xFF, 0xDA};
+        const size_t sos = size_t(std::search(whole.begin(), whole.end(), sos_marker, sos_marker + 2) - whole.begin());
+        const size_t header = sos + 2 + (whole[sos + 2] << 8 | whole[sos + 3]);
+        size_t seen = 0;
+        EXPECT_EQ(encode(info, {.hook = [&](EncoderContext* ctx, Stage stage) {
+                      uint8_t* buffer = nullptr;
+                      uint32_t length = 0;
+                      const uint8_t* r = eko_jpeg_enc_mcu__get_encdata(ctx, &buffer, &length);
+                      EXPECT_TRUE(r == buffer && length >= seen && length < whole.size() &&
+                                  std::equal(buffer, buffer + length, whole.begin()));
+                      EXPECT_TRUE(stage != Stage::Created || length == header);
+                      seen = length;
+                  }}), whole);
         // Coefficients read back from the stream are the library's own.
         EXPECT_EQ(encode(info, {.mode = Mode::Rows}), whole);
     }

@@ -20,10 +20,44 @@ Bytes scale(const Bytes& src, int sw, int sh, int stride, int dw, int dh) {
     return Bytes(dst.begin(), dst.end() - 16);
 }
 
-TEST(DownScale, GoldenCase) {
+// The down-scaled image by its closed form: output column i averages source
+// columns (sw/4 + i*sw)/dw and (3sw/4 + i*sw)/dw over the two rows chosen the
+// same way; chroma comes from even rows and even columns.
+Bytes reference(const Bytes& src, int sw, int sh, int stride, int dw, int dh) {
+    const auto tap = [](int n, int i, int d, int first) { return ((first ? n >> 2 : (3 * n) >> 2) + i * n) / d; };
+    const auto at = [&](int x, int y, int byte) { return src[size_t(y) * 2 * stride + (byte ? (2 * x & ~3) + byte : 2 * x)]; };
+    const auto mean = [&](int i, int k, int byte) {
+        int sum = 0;
+        for (int r : {1, 0})
+            for (int c : {1, 0}) sum += at(tap(sw, i, dw, c), tap(sh, k, dh, r), byte);
+        return uint8_t(sum / 4);
+    };
+    Bytes y, u, v;
+    for (int k = 0; k < dh; ++k)
+        for (int i = 0; i < dw; ++i) {
+            y.push_back(mean(i, k, 0));
+            if (k % 2 == 0 && i % 2 == 0) u.push_back(mean(i, k, 1)), v.push_back(mean(i, k, 3));
+        }
+    y.insert(y.end(), u.begin(), u.end());
+    y.insert(y.end(), v.begin(), v.end());
+    return y;
+}
+
+TEST(DownScale, GoldenCaseAndTheClosedFormOfEveryTap) {
     const Bytes in = read_file(golden_path("downscale-37x20s40-to-13x7.in"));
     ASSERT_EQ(in.size(), size_t(20 * 80));
     EXPECT_EQ(scale(in, 37, 20, 40, 13, 7), read_file(golden_path("downscale-37x20s40-to-13x7.expected")));
+    // Sizes whose quarter and three-quarter positions fall on every
+    // remainder, scale 1, halving, odd destinations and a wide stride.
+    const int cases[][5] = {{37, 20, 40, 13, 7}, {18, 18, 18, 7, 5}, {19, 17, 20, 19, 17}, {40, 22, 40, 20, 11},
+                            {641, 3, 700, 3, 1},  {6, 41, 8, 5, 40},  {23, 23, 24, 1, 1},   {101, 99, 102, 37, 29}};
+    for (const auto& [sw, sh, stride, dw, dh] : cases) {
+        Bytes src(size_t(sh) * stride * 2);
+        uint32_t seed = uint32_t(sw * 131 + sh);
+        for (auto& b : src) b = uint8_t((seed = seed * 1664525u + 1013904223u) >> 24);
+        EXPECT_EQ(scale(src, sw, sh, stride, dw, dh), reference(src, sw, sh, stride, dw, dh))
+            << sw << "x" << sh << " to " << dw << "x" << dh;
+    }
 }
 
 // The output as defined, with divisions: output pixel (i, k) averages the

@@ -1,6 +1,7 @@
 // Every SIMD level's input row kernels (RGB readers, packed 4:2:2 readers,
-// down-scaler) against the portable ones, byte for byte: random rows (extremes included) of every width from 1 to 48 and a
-// few large odd ones, and rows of real photographs. Each kernel is called
+// down-scaler) against the portable ones, byte for byte: random rows
+// (extremes included) of every width from 1 to 48 and a few large odd ones,
+// and rows of real photographs. Each kernel is called
 // directly through each level's table, whatever level the process runs, so
 // one run (and the sanitizer build) covers every level the processor has.
 // Sources and outputs are buffers of exactly the described size: a vector
@@ -114,15 +115,6 @@ std::vector<Level> vector_levels() {
 }
 
 // Bytes that are often 0 or 255, so the extremes of every sum occur.
-Bytes random_bytes(size_t n, uint32_t seed) {
-    Bytes b(n);
-    for (auto& v : b) {
-        seed = seed * 1664525u + 1013904223u;
-        const uint32_t pick = seed >> 30;
-        v = pick == 0 ? 0 : pick == 1 ? 255 : static_cast<uint8_t>(seed >> 16);
-    }
-    return b;
-}
 
 void expect_levels_match(const Bytes& src, uint32_t w, const std::string& what) {
     for (const KernelCase& c : kernel_cases()) {
@@ -144,7 +136,7 @@ TEST(PixelKernels, EveryLevelMatchesPortableOnRandomRows) {
     for (uint32_t w : {63u, 64u, 65u, 97u, 1001u, 3841u}) widths.push_back(w);
     for (uint32_t w : widths)
         for (uint32_t seed = 1; seed <= 4; ++seed)
-            expect_levels_match(random_bytes(4 * w, seed * 7919 + w), w, "width " + std::to_string(w));
+            expect_levels_match(tekoj_test::noise_with_extremes(4 * w, seed * 7919 + w), w, "width " + std::to_string(w));
 }
 
 TEST(PixelKernels, EveryLevelMatchesPortableOnPhotographs) {

@@ -10,6 +10,7 @@
 #include <cstdio>
 #include <filesystem>
 #include <fstream>
+#include <memory>
 #include <iterator>
 #include <unistd.h>
 
@@ -17,11 +18,12 @@ namespace tekoj_test {
 
 Decoded decode_jpeg(const Bytes& jpeg, bool force_grey) {
     Decoded d;
-    tjhandle h = tjInitDecompress();
+    // One decompressor per thread: making one costs more than a small decode.
+    thread_local const std::unique_ptr<void, int (*)(tjhandle)> handle(tjInitDecompress(), tjDestroy);
+    tjhandle h = handle.get();
     int w = 0, hgt = 0, subsamp = 0, cs = 0;
     if (tjDecompressHeader3(h, jpeg.data(), static_cast<unsigned long>(jpeg.size()), &w, &hgt, &subsamp, &cs) != 0) {
         d.message = tjGetErrorStr2(h);
-        tjDestroy(h);
         return d;
     }
     const bool grey = force_grey || cs == TJCS_GRAY;
@@ -38,7 +40,6 @@ Decoded decode_jpeg(const Bytes& jpeg, bool force_grey) {
     } else {
         d.ok = true;
     }
-    tjDestroy(h);
     return d;
 }
 
@@ -50,6 +51,16 @@ double psnr(const uint8_t* a, const uint8_t* b, size_t count) {
     }
     if (se == 0) return 99.0;
     return 10.0 * std::log10(255.0 * 255.0 * static_cast<double>(count) / se);
+}
+
+Bytes noise_with_extremes(size_t n, uint32_t seed) {
+    Bytes b(n);
+    for (auto& v : b) {
+        seed = seed * 1664525u + 1013904223u;
+        const uint32_t pick = seed >> 30;
+        v = pick == 0 ? 0 : pick == 1 ? 255 : static_cast<uint8_t>(seed >> 16);
+    }
+    return b;
 }
 
 Bytes photo_rgb(int width, int height, uint32_t seed) {
@@ -241,6 +252,16 @@ Call call_member(int m, const ImageInfo& info, uint32_t quality, const std::stri
     return c;
 }
 
+Bytes without_date(Bytes b) {
+    static const char kPattern[] = "dddd:dd:dd dd:dd:dd";
+    for (size_t i = 0; i + 19 <= b.size(); ++i) {
+        size_t k = 0;
+        while (k < 19 && (kPattern[k] == 'd' ? b[i + k] >= '0' && b[i + k] <= '9' : b[i + k] == uint8_t(kPattern[k]))) ++k;
+        if (k == 19) std::fill(b.begin() + long(i), b.begin() + long(i + 19), uint8_t('#'));
+    }
+    return b;
+}
+
 Bytes read_file(const std::string& path) {
     std::ifstream f(path, std::ios::binary);
     return Bytes(std::istreambuf_iterator<char>(f), std::istreambuf_iterator<char>());
@@ -251,7 +272,9 @@ bool file_exists(const std::string& path) { return std::ifstream(path).good(); }
 std::string golden_path(const std::string& name) { return std::string(TEKOJ_GOLDEN_DIR) + "/" + name; }
 
 std::string temp_path(const std::string& name) {
-    return "/tmp/tekoj_test_" + std::to_string(::getpid()) + "_" + name;
+    // In memory when the system offers it: some tests write thousands of files.
+    static const std::string dir = std::filesystem::is_directory("/dev/shm") ? "/dev/shm" : "/tmp";
+    return dir + "/tekoj_test_" + std::to_string(::getpid()) + "_" + name;
 }
 
 }  // namespace tekoj_test

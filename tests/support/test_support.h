@@ -26,6 +26,9 @@ Decoded decode_jpeg(const Bytes& jpeg, bool force_grey = false);
 // Peak signal-to-noise ratio of two same-sized sample arrays, in dB.
 double psnr(const uint8_t* a, const uint8_t* b, size_t count);
 
+// Random bytes, a quarter of them 0 and a quarter 255, so that the extremes of
+// every sum a kernel forms occur.
+Bytes noise_with_extremes(size_t n, uint32_t seed);
 // A smooth, photo-like RGB image (gradients, soft edges, mild texture).
 Bytes photo_rgb(int width, int height, uint32_t seed = 1);
 // Converts interleaved RGB to another input layout of the library.
@@ -67,6 +70,10 @@ struct Call {
 // With `fail_at` >= 0 that allocation of the member call itself fails.
 Call call_member(int m, const ImageInfo& info, uint32_t quality, const std::string& path, int32_t start = 0,
                  int64_t fail_at = -1);
+
+// The stream with its EXIF DateTime text ("YYYY:MM:DD HH:MM:SS") blanked:
+// the clock may tick between two encodes.
+Bytes without_date(Bytes jpeg);
 
 // Files.
 Bytes read_file(const std::string& path);

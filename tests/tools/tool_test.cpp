@@ -398,6 +398,17 @@ TEST_F(Tool, EncodesARealPhotograph) {
     const Decoded d = decode(read_text(g_dir + "/out/a.jpg"));
     EXPECT_EQ(d.width, 512);
     EXPECT_EQ(d.height, 512);
+    // Threads change no byte: RGB and grey rows read whole, a 4:2:0 frame.
+    const std::string size = std::to_string(W) + "x" + std::to_string(H);
+    for (const std::vector<std::string>& input : std::vector<std::vector<std::string>>{
+             {photo}, {"--grey", photo}, {"grey.pgm"}, {"--size", size, "frame.i420"}}) {
+        std::vector<std::string> one = input, three = input;
+        one.insert(one.end(), {"--threads", "1", "out/1.jpg"});
+        three.insert(three.end(), {"--threads", "3", "out/3.jpg"});
+        ASSERT_EQ(run(one).status, 0);
+        ASSERT_EQ(run(three).status, 0);
+        EXPECT_EQ(read_text(g_dir + "/out/1.jpg"), read_text(g_dir + "/out/3.jpg")) << input.back();
+    }
 }
 
 }  // namespace
