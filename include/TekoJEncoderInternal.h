@@ -172,6 +172,7 @@ struct EncoderContext {
     uint32_t failed;           /* error code that stopped this encode, 0 while healthy */
     uint32_t restart_suspended; /* nonzero: the block coder inserts no restart markers */
     uint32_t finished;          /* nonzero once the stream has been completed */
+    struct EkoCoderTables* coder_tables; /* the block coder's read-only tables */
 };
 
 /* Error hook: records the code that eko_GetLastError() reports. */

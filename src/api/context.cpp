@@ -1,18 +1,17 @@
 // Encoder context: creation validates the caller's records and allocates
 // every working buffer of one encode; release frees them again.
 #include "api/context.h"
-#include "api/output_target.h"
+#include "sink/output_target.h"
+#include "core/band_driver.h"
 #include "core/entropy_coder.h"
+#include "core/huffman_tables.h"
+#include "core/quant_tables.h"
+#include "input/formats.h"
 
 namespace tekoj {
 namespace {
 
 constexpr int32_t kMaxDimension = 49999;
-
-bool is_rgb_format(uint32_t format) {
-    return format == EKO_FORMAT_RGB565 || format == EKO_FORMAT_RGB888 || format == EKO_FORMAT_RGBA8888 ||
-           format == EKO_FORMAT_BGRA8888;
-}
 
 // An EncoderSettings record must describe a geometry the readers and the
 // transform can serve: 1 or 3 components, factors of at least 1, at most
@@ -36,7 +35,7 @@ bool settings_usable(const EncoderContext* ctx) {
         if (n == 3 && (spec[1] == 0 || spec[2] == 0)) return false;
     }
     if (ctx->format == EKO_FORMAT_GREY && n != 1) return false;
-    if (is_rgb_format(ctx->format)) {
+    if (format_traits(ctx->format)->rgb) {
         // The RGB readers produce 4:2:0 samples only.
         if (n != 3) return false;
         const uint8_t(*c)[3] = s->component_specs;
@@ -71,16 +70,16 @@ void release_band_rows(EncoderContext* ctx) {
 void discard_context(EncoderContext* ctx) {
     if (ctx->work_buffer != nullptr) DORVATEKO_OsFree(ctx->work_buffer);
     ctx->work_buffer = nullptr;
-    __eko_jpeg_enc_release_mem(ctx);
+    tekoj::release_buffers(ctx);
     DORVATEKO_OsFree(ctx);
 }
 
 }  // namespace tekoj
 
-extern "C" {
+namespace tekoj {
 
-EKO_API EncoderContext* __eko_jpeg_enc_initiaize(const ImageInfo* image_info, const OutputRequest* output_request,
-                                                 const EncodeOptions* options, const EncoderSettings* settings) {
+EncoderContext* create_context(const ImageInfo* image_info, const OutputRequest* output_request,
+                               const EncodeOptions* options, const EncoderSettings* settings) {
     eko_SetError(EKO_OK);
     if (image_info == nullptr || output_request == nullptr || options == nullptr) {
         eko_SetError(EKO_ERR_ARGUMENT);
@@ -111,34 +110,27 @@ EKO_API EncoderContext* __eko_jpeg_enc_initiaize(const ImageInfo* image_info, co
     const auto* data = static_cast<const uint8_t*>(image_info->data);
     ctx->read_ptr = data;
 
-    switch (ctx->format) {
-        case EKO_FORMAT_GREY:
-            ctx->num_components = ctx->comps_in_scan = 1;
-            ctx->plane_y = data;
-            break;
-        case EKO_FORMAT_YUV420: {
-            ctx->num_components = ctx->comps_in_scan = 3;
+    const FormatTraits* format = format_traits(ctx->format);
+    if (format == nullptr) {
+        eko_SetError(EKO_ERR_FORMAT);
+        DORVATEKO_OsFree(ctx);
+        return nullptr;
+    }
+    ctx->num_components = ctx->comps_in_scan = format->components;
+    if (format->planar) {
+        ctx->plane_y = data;
+        if (format->components == 3) {
             // Offsets in the platform's size type: 49999 x 49999 overflows int.
             const size_t w = static_cast<size_t>(ctx->width > 0 ? ctx->width : 0);
             const size_t h = static_cast<size_t>(ctx->height > 0 ? ctx->height : 0);
-            ctx->plane_y = data;
             ctx->plane_u = data == nullptr ? nullptr : data + w * h;
             ctx->plane_v = ctx->plane_u == nullptr ? nullptr : ctx->plane_u + ((w + 1) >> 1) * ((h + 1) >> 1);
-            break;
         }
-        case EKO_FORMAT_RGB565:
-        case EKO_FORMAT_RGB888:
-        case EKO_FORMAT_RGBA8888:
-        case EKO_FORMAT_BGRA8888: ctx->num_components = ctx->comps_in_scan = 3; break;
-        default:
-            eko_SetError(EKO_ERR_FORMAT);
-            DORVATEKO_OsFree(ctx);
-            return nullptr;
     }
     if (ctx->has_settings) ctx->num_components = ctx->comps_in_scan = settings->num_components;
 
-    if (__eko_jpeg_enc_initail_setup(ctx) != 1) {
-        __eko_jpeg_enc_release_mem(ctx);
+    if (setup_context(ctx) != 1) {
+        release_buffers(ctx);
         DORVATEKO_OsFree(ctx);
         return nullptr;
     }
@@ -150,15 +142,15 @@ EKO_API EncoderContext* __eko_jpeg_enc_initiaize(const ImageInfo* image_info, co
         // A missing block has no room whatever the caller claims.
         t->capacity = output_request->buffer == nullptr ? 0 : output_request->capacity;
     } else {
-        ctx->work_buffer = static_cast<uint8_t*>(DORVATEKO_OsMalloc(tekoj::kWorkBufferSize));
+        ctx->work_buffer = static_cast<uint8_t*>(DORVATEKO_OsMalloc(kWorkBufferSize));
         if (ctx->work_buffer == nullptr) {
             eko_SetError(EKO_ERR_ALLOC);
-            __eko_jpeg_enc_release_mem(ctx);
+            release_buffers(ctx);
             DORVATEKO_OsFree(ctx);
             return nullptr;
         }
         t->buffer = ctx->work_buffer;
-        t->capacity = tekoj::kWorkBufferSize;
+        t->capacity = kWorkBufferSize;
         t->file = output_request->file;
     }
 
@@ -170,24 +162,24 @@ EKO_API EncoderContext* __eko_jpeg_enc_initiaize(const ImageInfo* image_info, co
     return ctx;
 }
 
-EKO_API uint32_t __eko_jpeg_enc_initail_setup(EncoderContext* context) {
+uint32_t setup_context(EncoderContext* context) {
     EncoderContext* ctx = context;
-    if (ctx->height < 1 || ctx->width < 1 || ctx->height > tekoj::kMaxDimension || ctx->width > tekoj::kMaxDimension) {
+    if (ctx->height < 1 || ctx->width < 1 || ctx->height > kMaxDimension || ctx->width > kMaxDimension) {
         eko_SetError(EKO_ERR_DIMENSIONS);
         return 0;
     }
-    if (ctx->num_components > 3 || (ctx->has_settings && !tekoj::settings_usable(ctx))) {
+    if (ctx->num_components > 3 || (ctx->has_settings && !settings_usable(ctx))) {
         eko_SetError(EKO_ERR_SAMPLING);
         return 0;
     }
-    if (__eko_jpeg_enc_set_quality(ctx) != 1) return 0;
+    if (set_quality(ctx) != 1) return 0;
 
     ctx->natural_order = static_cast<uint8_t*>(DORVATEKO_OsMalloc(64));
     if (ctx->natural_order == nullptr) {
         eko_SetError(EKO_ERR_ALLOC);
         return 0;
     }
-    DORVATEKO_OsMemcpy(ctx->natural_order, tekoj::kZigzagToNatural, 64);
+    DORVATEKO_OsMemcpy(ctx->natural_order, kZigzagToNatural, 64);
 
     ctx->mcu_state = static_cast<McuState*>(DORVATEKO_OsMalloc(sizeof(McuState)));
     if (ctx->mcu_state == nullptr) {
@@ -212,7 +204,8 @@ EKO_API uint32_t __eko_jpeg_enc_initail_setup(EncoderContext* context) {
     DORVATEKO_OsMemset(ctx->sample_rows, 0, sizeof(SampleRowSet));
 
     const uint32_t n = ctx->num_components;
-    ctx->comp_info = static_cast<ComponentInfo*>(DORVATEKO_OsMalloc(n * static_cast<uint32_t>(sizeof(ComponentInfo))));
+    ctx->comp_info =
+        static_cast<ComponentInfo*>(DORVATEKO_OsMalloc(n * static_cast<uint32_t>(sizeof(ComponentInfo))));
     if (ctx->comp_info == nullptr) {
         eko_SetError(EKO_ERR_ALLOC);
         return 0;
@@ -224,10 +217,10 @@ EKO_API uint32_t __eko_jpeg_enc_initail_setup(EncoderContext* context) {
         for (uint32_t c = 0; c < 3; ++c) {
             const uint8_t t = c == 0 ? 0 : 1;
             if (s != nullptr) {
-                __eko_jpeg_enc_set_component_info(ctx, c, c + 1, s->component_specs[c][1], s->component_specs[c][2],
+                set_component(ctx, c, c + 1, s->component_specs[c][1], s->component_specs[c][2],
                                                   s->component_specs[c][0], t, t);
             } else {
-                __eko_jpeg_enc_set_component_info(ctx, c, c + 1, ctx->default_sampling[2 * c],
+                set_component(ctx, c, c + 1, ctx->default_sampling[2 * c],
                                                   ctx->default_sampling[2 * c + 1], t, t, t);
             }
         }
@@ -238,7 +231,7 @@ EKO_API uint32_t __eko_jpeg_enc_initail_setup(EncoderContext* context) {
     } else {
         // A single component is always coded 1x1, whatever the record says,
         // so that its geometry matches its sample rows.
-        __eko_jpeg_enc_set_component_info(ctx, 0, 1, 1, 1, s != nullptr ? s->component_specs[0][0] : 0, 0, 0);
+        set_component(ctx, 0, 1, 1, 1, s != nullptr ? s->component_specs[0][0] : 0, 0, 0);
         ctx->max_h_samp = ctx->max_v_samp = 1;
     }
 
@@ -258,9 +251,10 @@ EKO_API uint32_t __eko_jpeg_enc_initail_setup(EncoderContext* context) {
     if (!tekoj::allocate_band_rows(ctx)) return 0;
     ctx->total_imcu_rows = static_cast<uint32_t>((ctx->height + mv - 1) / mv);
 
-    if (__eko_jpeg_enc_prepare_huffman_code(ctx) != 1) return 0;
-    if (__eko_jpeg_enc_setup_scan(ctx) != 1) return 0;
-    __eko_jpeg_enc_setup_imcu(ctx);
+    if (prepare_huffman(ctx) != 1) return 0;
+    if (setup_scan(ctx) != 1) return 0;
+    setup_band(ctx);
+    if (!build_coder_tables(ctx)) return 0;
 
     ctx->output = static_cast<OutputTarget*>(DORVATEKO_OsMalloc(sizeof(OutputTarget)));
     if (ctx->output == nullptr) {
@@ -271,7 +265,7 @@ EKO_API uint32_t __eko_jpeg_enc_initail_setup(EncoderContext* context) {
     return 1;
 }
 
-EKO_API void __eko_jpeg_enc_release_mem(EncoderContext* context) {
+void release_buffers(EncoderContext* context) {
     EncoderContext* ctx = context;
     if (ctx == nullptr) return;
     auto release = [](void* p) {
@@ -298,9 +292,21 @@ EKO_API void __eko_jpeg_enc_release_mem(EncoderContext* context) {
         release(ctx->entropy->ac_codes[1]);
         release(ctx->entropy);
     }
+    release(ctx->coder_tables);
     release(ctx->comp_info);
     release(ctx->natural_order);
     release(ctx->output);
 }
+
+}  // namespace tekoj
+
+extern "C" {
+
+EKO_API EncoderContext* __eko_jpeg_enc_initiaize(const ImageInfo* image_info, const OutputRequest* output_request,
+                                                 const EncodeOptions* options, const EncoderSettings* settings) {
+    return tekoj::create_context(image_info, output_request, options, settings);
+}
+EKO_API uint32_t __eko_jpeg_enc_initail_setup(EncoderContext* context) { return tekoj::setup_context(context); }
+EKO_API void __eko_jpeg_enc_release_mem(EncoderContext* context) { tekoj::release_buffers(context); }
 
 }  // extern "C"

@@ -2,15 +2,20 @@
 // codes the image band by band, completes the stream and releases
 // everything. The buffer member also codes single bands of a larger image.
 #include "api/context.h"
-#include "api/output_target.h"
+#include "sink/output_target.h"
 #include "core/band_driver.h"
+#include "core/header_writer.h"
+#include "input/formats.h"
 
 namespace tekoj {
 namespace {
 
 constexpr uint32_t kMinMemoryBlock = 2048;
 
-uint32_t band_height(const ImageInfo* info) { return (info->format & 0xFF) == EKO_FORMAT_GREY ? 8 : 16; }
+uint32_t band_height(const ImageInfo* info) {
+    const FormatTraits* format = format_traits(info->format & 0xFF);
+    return format != nullptr ? format->band_height : 16;
+}
 
 // Band words that cannot describe a valid piece of one stream.
 bool band_words_valid(const ImageInfo* info) {
@@ -39,7 +44,7 @@ Result run(const ImageInfo* info, const OutputRequest& request, const EncodeOpti
         eko_SetError(EKO_ERR_ARGUMENT);
         return {Outcome::CreationFailed, nullptr, 0};
     }
-    EncoderContext* ctx = __eko_jpeg_enc_initiaize(info, &request, options, nullptr);
+    EncoderContext* ctx = create_context(info, &request, options, nullptr);
     if (ctx == nullptr) return {Outcome::CreationFailed, nullptr, 0};
     if (request.kind == EKO_OUTPUT_STREAM) {
         ctx->output->callback = callback;
@@ -50,7 +55,7 @@ Result run(const ImageInfo* info, const OutputRequest& request, const EncodeOpti
     if (!later_band) {
         ctx->exif_info = info->exif_info;
         if (band_mode) ctx->height = info->total_height;
-        __eko_jpeg_enc_make_header(ctx);
+        tekoj::write_header(ctx);
         ctx->height = info->height;
     } else {
         // Continue the whole stream's restart numbering: the band starts with
@@ -69,9 +74,9 @@ Result run(const ImageInfo* info, const OutputRequest& request, const EncodeOpti
     }
     if (ctx->failed == 0) {
         if (band_mode && info->band_open_end != 0)
-            __eko_jpeg_enc_make_without_end_mark(ctx);
+            tekoj::complete_stream(ctx, false);
         else
-            __eko_jpeg_enc_make_end_mark(ctx);
+            tekoj::complete_stream(ctx, true);
     }
 
     Result r{ctx->failed == 0 ? Outcome::Done : Outcome::Failed, nullptr, 0};

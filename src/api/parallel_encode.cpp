@@ -17,9 +17,11 @@
 // behind for that worker. A file or stream target takes the row buffers as
 // they are; a memory target gets each row appended once.
 #include "api/context.h"
-#include "api/output_target.h"
 #include "core/band_driver.h"
+#include "core/entropy_coder.h"
+#include "core/header_writer.h"
 #include "input/readers.h"
+#include "sink/output_target.h"
 
 #include <condition_variable>
 #include <mutex>
@@ -212,7 +214,7 @@ bool code_row(const Encode* e, EncoderContext* w, OutputTarget* out, uint32_t ro
     McuState* st = w->mcu_state;
     st->imcu_row = row;
     for (uint32_t c = 0; c < w->comps_in_scan; ++c) w->comp_info[c].rows_this_band = w->comp_info[c].band_rows;
-    __eko_jpeg_enc_setup_imcu(w);
+    setup_band(w);
     w->entropy->put_buffer = 0;
     w->entropy->put_bits = 0;
     for (int c = 0; c < 3; ++c) w->entropy->last_dc_val[c] = 0;
@@ -227,24 +229,16 @@ bool code_row(const Encode* e, EncoderContext* w, OutputTarget* out, uint32_t ro
         w->restart_index = static_cast<uint32_t>((n - 1) & 7);
     }
     if (!process_band(w) || !make_room(w, 16, 16)) return false;
-    __eko_jpeg_enc_finish_compression(w);
+    pad_final_byte(w);
     return w->failed == 0;
 }
 
-// Passes a coded row to the main target: appended to a memory block, handed
-// to the file in one piece, to the callback in pieces of at most 4096 bytes.
+// Passes a coded row to the main target the way its kind passes long runs:
+// appended to a memory block, handed to the file in one piece, to the
+// callback in pieces of at most 4096 bytes.
 bool hand_on_row(EncoderContext* main, const OutputTarget& row) {
-    const uint8_t* p = row.buffer;
-    uint32_t left = row.used;
-    if (main->output->kind == EKO_OUTPUT_MEMORY) return write_bytes(main, p, left);
-    const uint32_t piece_limit = main->output->kind == EKO_OUTPUT_STREAM ? kWorkBufferSize : left;
-    while (left > 0) {
-        const uint32_t piece = left < piece_limit ? left : piece_limit;
-        if (!write_direct(main, p, piece)) return false;
-        p += piece;
-        left -= piece;
-    }
-    return main->failed == 0;
+    const Sink sink = sink_of(main);
+    return kind_of(sink.target).write_run(sink, row.buffer, row.used) && main->failed == 0;
 }
 
 // Serial mode: the rows are one restart interval (or none), so each is coded
@@ -326,7 +320,7 @@ EKO_API EkoParallelEncode* eko_enc_jpeg_parallel_create(const ImageInfo* image_i
         refuse(EKO_ERR_ARGUMENT);
         return nullptr;
     }
-    EncoderContext* main = __eko_jpeg_enc_initiaize(image_info, output, options, settings);
+    EncoderContext* main = create_context(image_info, output, options, settings);
     if (main == nullptr) return nullptr;
     void* place = DORVATEKO_OsMalloc(sizeof(Encode));
     if (place == nullptr) {
@@ -352,7 +346,7 @@ EKO_API EkoParallelEncode* eko_enc_jpeg_parallel_create(const ImageInfo* image_i
         main->output->callback_arg = callback_arg;
     }
     main->exif_info = image_info->exif_info;
-    __eko_jpeg_enc_make_header(main);
+    write_header(main);
     e->failed = main->failed;
     return e;
 }
@@ -394,7 +388,7 @@ EKO_API uint32_t eko_enc_jpeg_parallel_finish(EkoParallelEncode* encode, uint8_t
             if (e->worker[i].busy) return refuse(EKO_ERR_STATE);
         if (e->failed == 0 && e->handed != e->rows) fail_locked(e, EKO_ERR_STATE);
     }
-    bool ok = e->failed == 0 && __eko_jpeg_enc_make_end_mark(main) == 1 && main->failed == 0;
+    bool ok = e->failed == 0 && complete_stream(main, true) && main->failed == 0;
     OutputTarget* t = main->output;
     uint8_t* block = nullptr;
     uint32_t length = 0;

@@ -1,6 +1,9 @@
 // Header writer: SOI, JFIF APP0, (EXIF APP1), DQT, SOF0, DHT, DRI and SOS.
-#include "api/output_target.h"
+#include "core/header_writer.h"
+
 #include "core/entropy_coder.h"
+#include "exif/exif_block.h"
+#include "sink/output_target.h"
 
 namespace tekoj {
 namespace {
@@ -17,90 +20,87 @@ void put_marker(OutputTarget* t, uint32_t code, uint32_t length) {
     put_u16(t, length);
 }
 
-}  // namespace
-}  // namespace tekoj
-
-extern "C" {
-
-EKO_API void __eko_jpeg_enc_write_app0_marker(EncoderContext* context) {
+void write_app0(EncoderContext* context) {
     OutputTarget* t = context->output;
-    DORVATEKO_OsMemcpy(t->buffer + t->used, tekoj::kApp0, sizeof tekoj::kApp0);
-    t->used += sizeof tekoj::kApp0;
+    DORVATEKO_OsMemcpy(t->buffer + t->used, kApp0, sizeof kApp0);
+    t->used += sizeof kApp0;
 }
 
-EKO_API void __eko_jpeg_enc_write_dqt_marker(EncoderContext* context, uint32_t table) {
+void write_dqt(EncoderContext* context, uint32_t table) {
     OutputTarget* t = context->output;
-    tekoj::put_marker(t, 0xFFDB, 67);
-    tekoj::put_byte(t, table);
+    put_marker(t, 0xFFDB, 67);
+    put_byte(t, table);
     const uint32_t* q = context->quant_tbl[table];
-    for (int k = 0; k < 64; ++k) tekoj::put_byte(t, q[context->natural_order[k]] & 0xFF);
+    for (int k = 0; k < 64; ++k) put_byte(t, q[context->natural_order[k]] & 0xFF);
 }
 
-EKO_API void __eko_jpeg_enc_write_sof_marker(EncoderContext* context) {
+void write_sof(EncoderContext* context) {
     OutputTarget* t = context->output;
-    tekoj::put_marker(t, 0xFFC0, 8 + 3u * context->num_components);
-    tekoj::put_byte(t, 8);
-    tekoj::put_u16(t, static_cast<uint32_t>(context->height));
-    tekoj::put_u16(t, static_cast<uint32_t>(context->width));
-    tekoj::put_byte(t, context->num_components);
+    put_marker(t, 0xFFC0, 8 + 3u * context->num_components);
+    put_byte(t, 8);
+    put_u16(t, static_cast<uint32_t>(context->height));
+    put_u16(t, static_cast<uint32_t>(context->width));
+    put_byte(t, context->num_components);
     for (uint32_t c = 0; c < context->num_components; ++c) {
         const ComponentInfo& comp = context->comp_info[c];
-        tekoj::put_byte(t, comp.component_id);
-        tekoj::put_byte(t, (comp.h_samp_factor << 4) + comp.v_samp_factor);
-        tekoj::put_byte(t, comp.quant_tbl_no);
+        put_byte(t, comp.component_id);
+        put_byte(t, (comp.h_samp_factor << 4) + comp.v_samp_factor);
+        put_byte(t, comp.quant_tbl_no);
     }
 }
 
-EKO_API void __eko_jpeg_enc_write_dht_marker(EncoderContext* context, uint32_t table, uint32_t is_ac) {
+void write_dht(EncoderContext* context, uint32_t table, uint32_t is_ac) {
     OutputTarget* t = context->output;
     const HuffmanSpec* spec = is_ac ? context->ac_spec[table] : context->dc_spec[table];
     uint32_t symbols = 0;
     for (int l = 1; l <= 16; ++l) symbols += spec->bits[l];
-    tekoj::put_marker(t, 0xFFC4, 19 + symbols);
-    tekoj::put_byte(t, is_ac ? 16 + table : table);
+    put_marker(t, 0xFFC4, 19 + symbols);
+    put_byte(t, is_ac ? 16 + table : table);
     DORVATEKO_OsMemcpy(t->buffer + t->used, spec->bits + 1, 16);
     t->used += 16;
     DORVATEKO_OsMemcpy(t->buffer + t->used, spec->huffval, symbols);
     t->used += symbols;
 }
 
-EKO_API void __eko_jpeg_enc_write_sos_marker(EncoderContext* context) {
+void write_sos(EncoderContext* context) {
     OutputTarget* t = context->output;
-    tekoj::put_marker(t, 0xFFDA, 6 + 2u * context->num_components);
-    tekoj::put_byte(t, context->comps_in_scan);
+    put_marker(t, 0xFFDA, 6 + 2u * context->num_components);
+    put_byte(t, context->comps_in_scan);
     for (uint32_t c = 0; c < context->comps_in_scan; ++c) {
         const ComponentInfo* comp = context->cur_comp_info[c];
-        tekoj::put_byte(t, comp->component_id);
-        tekoj::put_byte(t, (comp->dc_tbl_no << 4) + comp->ac_tbl_no);
+        put_byte(t, comp->component_id);
+        put_byte(t, (comp->dc_tbl_no << 4) + comp->ac_tbl_no);
     }
-    tekoj::put_byte(t, 0);
-    tekoj::put_byte(t, 63);
-    tekoj::put_byte(t, 0);
+    put_byte(t, 0);
+    put_byte(t, 63);
+    put_byte(t, 0);
 }
 
-EKO_API uint32_t __eko_jpeg_enc_make_header(EncoderContext* context) {
+}  // namespace
+
+uint32_t write_header(EncoderContext* context) {
     EncoderContext* ctx = context;
     // A memory target may start with less room than the header needs (or no
     // block at all): make the room before writing instead of trusting it.
-    if (!tekoj::ensure_room(ctx, 2 + sizeof tekoj::kApp0)) return 0;
-    tekoj::put_u16(ctx->output, 0xFFD8);
-    __eko_jpeg_enc_write_app0_marker(ctx);
-    __eko_jpeg_enc_write_app1_marker(ctx);
-    if (ctx->failed != 0 || !tekoj::ensure_room(ctx, tekoj::kHeaderTailRoom)) return 0;
+    if (!ensure_room(ctx, 2 + sizeof kApp0)) return 0;
+    put_u16(ctx->output, 0xFFD8);
+    write_app0(ctx);
+    write_app1(ctx);
+    if (ctx->failed != 0 || !ensure_room(ctx, kHeaderTailRoom)) return 0;
 
     if (ctx->num_components == 1) {
-        __eko_jpeg_enc_write_dqt_marker(ctx, 0);
-        __eko_jpeg_enc_write_sof_marker(ctx);
-        __eko_jpeg_enc_write_dht_marker(ctx, 0, 0);
-        __eko_jpeg_enc_write_dht_marker(ctx, 0, 1);
+        write_dqt(ctx, 0);
+        write_sof(ctx);
+        write_dht(ctx, 0, 0);
+        write_dht(ctx, 0, 1);
     } else {
         const int32_t tables = ctx->has_settings ? ctx->settings->num_quant_tables : 2;
-        for (int32_t q = 0; q < tables; ++q) __eko_jpeg_enc_write_dqt_marker(ctx, static_cast<uint32_t>(q));
-        __eko_jpeg_enc_write_sof_marker(ctx);
-        __eko_jpeg_enc_write_dht_marker(ctx, 0, 0);
-        __eko_jpeg_enc_write_dht_marker(ctx, 0, 1);
-        __eko_jpeg_enc_write_dht_marker(ctx, 1, 0);
-        __eko_jpeg_enc_write_dht_marker(ctx, 1, 1);
+        for (int32_t q = 0; q < tables; ++q) write_dqt(ctx, static_cast<uint32_t>(q));
+        write_sof(ctx);
+        write_dht(ctx, 0, 0);
+        write_dht(ctx, 0, 1);
+        write_dht(ctx, 1, 0);
+        write_dht(ctx, 1, 1);
     }
     uint32_t dri = 0;
     if (ctx->has_settings) {
@@ -109,11 +109,26 @@ EKO_API uint32_t __eko_jpeg_enc_make_header(EncoderContext* context) {
         dri = ctx->restart_interval;
     }
     if (dri != 0) {
-        tekoj::put_marker(ctx->output, 0xFFDD, 4);
-        tekoj::put_u16(ctx->output, dri);
+        put_marker(ctx->output, 0xFFDD, 4);
+        put_u16(ctx->output, dri);
     }
-    __eko_jpeg_enc_write_sos_marker(ctx);
+    write_sos(ctx);
     return 1;
 }
+
+}  // namespace tekoj
+
+extern "C" {
+
+EKO_API void __eko_jpeg_enc_write_app0_marker(EncoderContext* context) { tekoj::write_app0(context); }
+EKO_API void __eko_jpeg_enc_write_dqt_marker(EncoderContext* context, uint32_t table) {
+    tekoj::write_dqt(context, table);
+}
+EKO_API void __eko_jpeg_enc_write_sof_marker(EncoderContext* context) { tekoj::write_sof(context); }
+EKO_API void __eko_jpeg_enc_write_dht_marker(EncoderContext* context, uint32_t table, uint32_t is_ac) {
+    tekoj::write_dht(context, table, is_ac);
+}
+EKO_API void __eko_jpeg_enc_write_sos_marker(EncoderContext* context) { tekoj::write_sos(context); }
+EKO_API uint32_t __eko_jpeg_enc_make_header(EncoderContext* context) { return tekoj::write_header(context); }
 
 }  // extern "C"

@@ -64,10 +64,10 @@ DcCodeTable* make_dc_table(const uint16_t* codes, const uint8_t* sizes) {
 }  // namespace
 }  // namespace tekoj
 
-extern "C" {
+namespace tekoj {
 
-EKO_API uint32_t __eko_jpeg_enc_create_huffman_tbl(EncoderContext* context, const uint8_t* bits,
-                                                   const uint8_t* values, HuffmanSpec** slot) {
+uint32_t create_huffman_spec(EncoderContext* context, const uint8_t* bits, const uint8_t* values,
+                             HuffmanSpec** slot) {
     (void)context;
     auto* spec = static_cast<HuffmanSpec*>(DORVATEKO_OsMalloc(sizeof(HuffmanSpec)));
     if (spec == nullptr) {
@@ -76,21 +76,21 @@ EKO_API uint32_t __eko_jpeg_enc_create_huffman_tbl(EncoderContext* context, cons
     }
     DORVATEKO_OsMemset(spec, 0, sizeof(HuffmanSpec));
     std::memcpy(spec->bits, bits, 17);
-    std::memcpy(spec->huffval, values, static_cast<size_t>(tekoj::count_codes(bits)));
+    std::memcpy(spec->huffval, values, static_cast<size_t>(count_codes(bits)));
     *slot = spec;
     return 1;
 }
 
-EKO_API uint32_t __eko_jpeg_enc_set_huffman_spec_tbl(EncoderContext* context) {
+uint32_t set_huffman_specs(EncoderContext* context) {
     using namespace tekoj;
-    uint32_t ok = __eko_jpeg_enc_create_huffman_tbl(context, kDcLumaBits, kDcLumaValues, &context->dc_spec[0]);
-    ok = __eko_jpeg_enc_create_huffman_tbl(context, kAcLumaBits, kAcLumaValues, &context->ac_spec[0]) && ok;
-    ok = __eko_jpeg_enc_create_huffman_tbl(context, kDcChromaBits, kDcChromaValues, &context->dc_spec[1]) && ok;
-    ok = __eko_jpeg_enc_create_huffman_tbl(context, kAcChromaBits, kAcChromaValues, &context->ac_spec[1]) && ok;
+    uint32_t ok = create_huffman_spec(context, kDcLumaBits, kDcLumaValues, &context->dc_spec[0]);
+    ok = create_huffman_spec(context, kAcLumaBits, kAcLumaValues, &context->ac_spec[0]) && ok;
+    ok = create_huffman_spec(context, kDcChromaBits, kDcChromaValues, &context->dc_spec[1]) && ok;
+    ok = create_huffman_spec(context, kAcChromaBits, kAcChromaValues, &context->ac_spec[1]) && ok;
     return ok;
 }
 
-EKO_API uint32_t __eko_jpeg_enc_prepare_derived_tbl(EncoderContext* context, uint32_t table, AcCodeTable** slot) {
+uint32_t prepare_code_table(EncoderContext* context, uint32_t table, AcCodeTable** slot) {
     auto* t = static_cast<AcCodeTable*>(DORVATEKO_OsMalloc(sizeof(AcCodeTable)));
     *slot = t;
     if (t == nullptr) {
@@ -115,12 +115,12 @@ EKO_API uint32_t __eko_jpeg_enc_prepare_derived_tbl(EncoderContext* context, uin
     return 1;
 }
 
-EKO_API uint32_t __eko_jpeg_enc_prepare_huffman_code(EncoderContext* context) {
+uint32_t prepare_huffman(EncoderContext* context) {
     uint8_t* nbits = context->nbits_table;
     nbits[0] = 0;
     for (uint32_t v = 1; v < 4096; ++v) nbits[v] = static_cast<uint8_t>(32 - __builtin_clz(v));
 
-    if (__eko_jpeg_enc_set_huffman_spec_tbl(context) != 1) return 0;
+    if (set_huffman_specs(context) != 1) return 0;
 
     auto* entropy = static_cast<EntropyState*>(DORVATEKO_OsMalloc(sizeof(EntropyState)));
     if (entropy == nullptr) {
@@ -130,18 +130,36 @@ EKO_API uint32_t __eko_jpeg_enc_prepare_huffman_code(EncoderContext* context) {
     DORVATEKO_OsMemset(entropy, 0, sizeof(EntropyState));
     context->entropy = entropy;
 
-    entropy->dc_codes[0] = tekoj::make_dc_table(tekoj::kDcLumaCode, tekoj::kDcLumaSize);
+    entropy->dc_codes[0] = make_dc_table(kDcLumaCode, kDcLumaSize);
     if (entropy->dc_codes[0] == nullptr) {
         eko_SetError(EKO_ERR_ALLOC);
         return 0;
     }
-    entropy->dc_codes[1] = tekoj::make_dc_table(tekoj::kDcChromaCode, tekoj::kDcChromaSize);
+    entropy->dc_codes[1] = make_dc_table(kDcChromaCode, kDcChromaSize);
     if (entropy->dc_codes[1] == nullptr) {
         eko_SetError(EKO_ERR_ALLOC);
         return 0;
     }
-    if (__eko_jpeg_enc_prepare_derived_tbl(context, 0, &entropy->ac_codes[0]) != 1) return 0;
-    return __eko_jpeg_enc_prepare_derived_tbl(context, 1, &entropy->ac_codes[1]);
+    if (prepare_code_table(context, 0, &entropy->ac_codes[0]) != 1) return 0;
+    return prepare_code_table(context, 1, &entropy->ac_codes[1]);
+}
+
+}  // namespace tekoj
+
+extern "C" {
+
+EKO_API uint32_t __eko_jpeg_enc_create_huffman_tbl(EncoderContext* context, const uint8_t* bits,
+                                                   const uint8_t* values, HuffmanSpec** slot) {
+    return tekoj::create_huffman_spec(context, bits, values, slot);
+}
+EKO_API uint32_t __eko_jpeg_enc_set_huffman_spec_tbl(EncoderContext* context) {
+    return tekoj::set_huffman_specs(context);
+}
+EKO_API uint32_t __eko_jpeg_enc_prepare_derived_tbl(EncoderContext* context, uint32_t table, AcCodeTable** slot) {
+    return tekoj::prepare_code_table(context, table, slot);
+}
+EKO_API uint32_t __eko_jpeg_enc_prepare_huffman_code(EncoderContext* context) {
+    return tekoj::prepare_huffman(context);
 }
 
 }  // extern "C"

@@ -1,5 +1,7 @@
 #pragma once
 
+#include <TekoJEncoderInternal.h>
+
 #include <cstdint>
 
 namespace tekoj {
@@ -14,5 +16,9 @@ extern const uint8_t kAcLumaBits[17];
 extern const uint8_t kAcLumaValues[162];
 extern const uint8_t kAcChromaBits[17];
 extern const uint8_t kAcChromaValues[162];
+
+// Builds the magnitude table, the standard Huffman specifications and the
+// code tables of an encode. 0 after reporting an allocation failure.
+uint32_t prepare_huffman(EncoderContext* ctx);
 
 }  // namespace tekoj

@@ -1,10 +1,10 @@
 // Scan geometry and the band (MCU-row) driver: reads one band through the
 // format's reader, transforms each block of every MCU and hands the MCU to
 // the block coder. Blocks wholly outside the image become cheap dummies.
-#include "api/output_target.h"
+#include "sink/output_target.h"
 #include "core/entropy_coder.h"
 #include "core/forward_dct.h"
-#include "input/readers.h"
+#include "input/formats.h"
 #include "core/band_driver.h"
 
 #include <cstring>
@@ -25,6 +25,10 @@ bool compress_band(EncoderContext* ctx, uint8_t** const* row_arrays) {
     const uint32_t last_col = ctx->mcus_per_row - 1;
     const uint32_t last_band = ctx->total_imcu_rows - 1;
     int16_t* const* mcu = st->mcu_buffer;
+    // One coder for the whole band: the accumulator carries over from MCU to
+    // MCU and is written out a whole word at a time.
+    RowCoder coder;
+    begin_coding(coder, ctx);
     for (uint32_t y = st->mcu_vert_offset; y < st->mcu_rows_per_imcu_row; ++y) {
         for (uint32_t x = st->mcu_ctr; x <= last_col; ++x) {
             uint32_t blkn = 0;
@@ -49,18 +53,19 @@ bool compress_band(EncoderContext* ctx, uint8_t** const* row_arrays) {
                     start_row += 8;
                 }
             }
-            if (!encode_mcu(ctx, mcu)) return false;
+            if (!code_mcu(coder, *ctx->coder_tables, mcu)) return false;
         }
         st->mcu_ctr = 0;
     }
+    end_coding(coder, ctx);
     ++st->imcu_row;
-    __eko_jpeg_enc_setup_imcu(ctx);
+    tekoj::setup_band(ctx);
     return true;
 }
 
 bool process_band(EncoderContext* ctx) {
     if (ctx->failed != 0) return false;
-    read_band(ctx);
+    format_traits(ctx->format)->read(ctx);
     SampleRowSet* rows = ctx->sample_rows;
     const bool ok = compress_band(ctx, rows->row_arrays);
     ++rows->band_counter;
@@ -70,11 +75,10 @@ bool process_band(EncoderContext* ctx) {
 
 }  // namespace tekoj
 
-extern "C" {
+namespace tekoj {
 
-EKO_API uint32_t __eko_jpeg_enc_set_component_info(EncoderContext* context, uint32_t index, uint32_t id, uint8_t h,
-                                                   uint8_t v, uint8_t quant_tbl_no, uint8_t dc_tbl_no,
-                                                   uint8_t ac_tbl_no) {
+uint32_t set_component(EncoderContext* context, uint32_t index, uint32_t id, uint8_t h, uint8_t v,
+                       uint8_t quant_tbl_no, uint8_t dc_tbl_no, uint8_t ac_tbl_no) {
     ComponentInfo* comp = &context->comp_info[index];
     comp->component_id = static_cast<uint8_t>(id);
     comp->component_index = static_cast<uint8_t>(index);
@@ -88,7 +92,7 @@ EKO_API uint32_t __eko_jpeg_enc_set_component_info(EncoderContext* context, uint
     return 1;
 }
 
-EKO_API uint32_t __eko_jpeg_enc_setup_scan(EncoderContext* context) {
+uint32_t setup_scan(EncoderContext* context) {
     const uint32_t width = static_cast<uint32_t>(context->width);
     const uint32_t height = static_cast<uint32_t>(context->height);
     if (context->comps_in_scan == 1) {
@@ -130,7 +134,7 @@ EKO_API uint32_t __eko_jpeg_enc_setup_scan(EncoderContext* context) {
     return 1;
 }
 
-EKO_API uint32_t __eko_jpeg_enc_setup_imcu(EncoderContext* context) {
+uint32_t setup_band(EncoderContext* context) {
     McuState* st = context->mcu_state;
     const bool last = st->imcu_row == context->total_imcu_rows - 1;
     if (context->comps_in_scan > 1) {
@@ -151,6 +155,10 @@ EKO_API uint32_t __eko_jpeg_enc_setup_imcu(EncoderContext* context) {
     return 1;
 }
 
+}  // namespace tekoj
+
+extern "C" {
+
 EKO_API uint32_t __eko_jpeg_enc_compress_data(EncoderContext* context, uint8_t** const* row_arrays) {
     return tekoj::compress_band(context, row_arrays) ? 1 : 0;
 }
@@ -158,5 +166,13 @@ EKO_API uint32_t __eko_jpeg_enc_compress_data(EncoderContext* context, uint8_t**
 EKO_API uint32_t __eko_jpeg_enc_process_image_data(EncoderContext* context) {
     return tekoj::process_band(context) ? 1 : 0;
 }
+
+EKO_API uint32_t __eko_jpeg_enc_set_component_info(EncoderContext* context, uint32_t index, uint32_t id, uint8_t h,
+                                                   uint8_t v, uint8_t quant_tbl_no, uint8_t dc_tbl_no,
+                                                   uint8_t ac_tbl_no) {
+    return tekoj::set_component(context, index, id, h, v, quant_tbl_no, dc_tbl_no, ac_tbl_no);
+}
+EKO_API uint32_t __eko_jpeg_enc_setup_scan(EncoderContext* context) { return tekoj::setup_scan(context); }
+EKO_API uint32_t __eko_jpeg_enc_setup_imcu(EncoderContext* context) { return tekoj::setup_band(context); }
 
 }  // extern "C"

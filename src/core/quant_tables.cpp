@@ -2,7 +2,49 @@
 // a table with its reciprocal divisors for the forward transform.
 #include "core/quant_tables.h"
 
-#include "api/output_target.h"
+#include "sink/output_target.h"
+
+namespace tekoj {
+
+uint32_t set_quant_table(EncoderContext* context, const uint8_t* table, uint32_t slot) {
+    if (context == nullptr || table == nullptr || slot > 3) return 0;
+    auto* divisors = static_cast<uint32_t*>(DORVATEKO_OsMalloc(64 * sizeof(uint32_t)));
+    context->divisors[slot] = divisors;
+    if (divisors == nullptr) {
+        eko_SetError(EKO_ERR_ALLOC);
+        return 0;
+    }
+    auto* raw = static_cast<uint32_t*>(DORVATEKO_OsMalloc(64 * sizeof(uint32_t)));
+    context->quant_tbl[slot] = raw;
+    if (raw == nullptr) {
+        eko_SetError(EKO_ERR_ALLOC);
+        return 0;
+    }
+    for (int i = 0; i < 64; ++i) {
+        raw[i] = table[i];
+        divisors[i] = divisor_for(table[i], i);
+    }
+    return 1;
+}
+
+uint32_t set_quality(EncoderContext* context) {
+    if (context->quality == 0) context->quality = 1;
+    if (context->quality > 100) context->quality = 100;
+    if (context->has_settings) {
+        const EncoderSettings* s = context->settings;
+        for (int32_t t = 0; t < s->num_quant_tables; ++t)
+            if (set_quant_table(context, s->quant_tables[t], static_cast<uint32_t>(t)) != 1) return 0;
+        return 1;
+    }
+    const uint32_t scale = quality_scale(context->quality);
+    uint8_t table[64];
+    scale_table(eko_luminanceQuantTbl[0], scale, table);
+    if (set_quant_table(context, table, 0) != 1) return 0;
+    scale_table(eko_chrominanceQuantTbl[0], scale, table);
+    return set_quant_table(context, table, 1);
+}
+
+}  // namespace tekoj
 
 extern "C" {
 
@@ -83,41 +125,8 @@ uint32_t divisor_for(uint32_t q, int index) {
 extern "C" {
 
 EKO_API uint32_t __eko_jpeg_enc_set_quant_table(EncoderContext* context, const uint8_t* table, uint32_t slot) {
-    if (context == nullptr || table == nullptr || slot > 3) return 0;
-    auto* divisors = static_cast<uint32_t*>(DORVATEKO_OsMalloc(64 * sizeof(uint32_t)));
-    context->divisors[slot] = divisors;
-    if (divisors == nullptr) {
-        eko_SetError(EKO_ERR_ALLOC);
-        return 0;
-    }
-    auto* raw = static_cast<uint32_t*>(DORVATEKO_OsMalloc(64 * sizeof(uint32_t)));
-    context->quant_tbl[slot] = raw;
-    if (raw == nullptr) {
-        eko_SetError(EKO_ERR_ALLOC);
-        return 0;
-    }
-    for (int i = 0; i < 64; ++i) {
-        raw[i] = table[i];
-        divisors[i] = tekoj::divisor_for(table[i], i);
-    }
-    return 1;
+    return tekoj::set_quant_table(context, table, slot);
 }
-
-EKO_API uint32_t __eko_jpeg_enc_set_quality(EncoderContext* context) {
-    if (context->quality == 0) context->quality = 1;
-    if (context->quality > 100) context->quality = 100;
-    if (context->has_settings) {
-        const EncoderSettings* s = context->settings;
-        for (int32_t t = 0; t < s->num_quant_tables; ++t)
-            if (__eko_jpeg_enc_set_quant_table(context, s->quant_tables[t], static_cast<uint32_t>(t)) != 1) return 0;
-        return 1;
-    }
-    const uint32_t scale = tekoj::quality_scale(context->quality);
-    uint8_t table[64];
-    tekoj::scale_table(eko_luminanceQuantTbl[0], scale, table);
-    if (__eko_jpeg_enc_set_quant_table(context, table, 0) != 1) return 0;
-    tekoj::scale_table(eko_chrominanceQuantTbl[0], scale, table);
-    return __eko_jpeg_enc_set_quant_table(context, table, 1);
-}
+EKO_API uint32_t __eko_jpeg_enc_set_quality(EncoderContext* context) { return tekoj::set_quality(context); }
 
 }  // extern "C"

@@ -6,7 +6,7 @@
 // either refused as a whole (length field overflow, bad thumbnail pointer) or
 // written completely into room made for it: in place when the target can
 // offer that much contiguous space, else staged in a block of its exact size.
-#include "api/output_target.h"
+#include "sink/output_target.h"
 #include "exif/exif_block.h"
 
 namespace {
@@ -27,48 +27,54 @@ void build_segment(uint8_t* out, const ExifInfo* exif, uint32_t segment_length) 
 
 }  // namespace
 
-extern "C" {
+namespace tekoj {
 
-EKO_API void __eko_jpeg_enc_write_app1_marker(EncoderContext* ctx) {
+void write_app1(EncoderContext* ctx) {
     if (ctx == nullptr || ctx->exif_info == nullptr || ctx->failed != 0) return;
     const ExifInfo* exif = ctx->exif_info;
     const bool with_thumbnail = exif->has_thumbnail != 0;
     if (with_thumbnail && exif->thumb_data == nullptr && exif->thumb_length != 0) {
-        tekoj::fail(ctx, EKO_ERR_ARGUMENT);
+        fail(ctx, EKO_ERR_ARGUMENT);
         return;
     }
 
-    const uint64_t block_size = tekoj::exif_block_size(exif);
+    const uint64_t block_size = exif_block_size(exif);
     const uint64_t segment_length = 8 + block_size + (with_thumbnail ? exif->thumb_length : 0);
     if (segment_length > kMaxSegmentLength) {
-        tekoj::fail(ctx, EKO_ERR_TOO_LARGE);
+        fail(ctx, EKO_ERR_TOO_LARGE);
         return;
     }
     const uint32_t bytes = kApp1HeadSize + static_cast<uint32_t>(block_size);
     const uint32_t length_field = static_cast<uint32_t>(segment_length);
 
     OutputTarget* t = ctx->output;
-    if (t->kind == EKO_OUTPUT_MEMORY || bytes <= tekoj::kWorkBufferSize) {
-        if (!tekoj::ensure_room(ctx, bytes)) return;
+    if (bytes <= kind_of(t).longest_run) {
+        if (!ensure_room(ctx, bytes)) return;
         build_segment(t->buffer + t->used, exif, length_field);
         t->used += bytes;
     } else {
-        // Longer than a file or stream target's work buffer: build it aside
-        // and let the target pass it on in work-buffer pieces.
+        // Longer than the target's buffer can take (a file or stream target's
+        // work buffer): build it aside and let the target pass it on in pieces.
         auto* staging = static_cast<uint8_t*>(DORVATEKO_OsMalloc(bytes));
         if (staging == nullptr) {
-            tekoj::fail(ctx, EKO_ERR_ALLOC);
+            fail(ctx, EKO_ERR_ALLOC);
             return;
         }
         build_segment(staging, exif, length_field);
-        const bool written = tekoj::write_bytes(ctx, staging, bytes);
+        const bool written = write_bytes(ctx, staging, bytes);
         DORVATEKO_OsFree(staging);
         if (!written) return;
     }
 
     // File and stream targets hand what they hold on first and pass the
     // caller's thumbnail in one piece; a memory target copies it.
-    if (with_thumbnail) tekoj::write_direct(ctx, exif->thumb_data, exif->thumb_length);
+    if (with_thumbnail) write_direct(ctx, exif->thumb_data, exif->thumb_length);
 }
+
+}  // namespace tekoj
+
+extern "C" {
+
+EKO_API void __eko_jpeg_enc_write_app1_marker(EncoderContext* ctx) { tekoj::write_app1(ctx); }
 
 }  // extern "C"

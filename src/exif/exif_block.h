@@ -21,4 +21,8 @@ uint64_t exif_block_size(const ExifInfo* exif);
 // always keeps its fixed width.
 void format_exif_date(const std::tm& local, char out[kExifDateLength + 1]);
 
+// Writes the APP1 segment of the context's EXIF description (nothing when
+// it has none); a refused description fails the encode.
+void write_app1(EncoderContext* ctx);
+
 }  // namespace tekoj

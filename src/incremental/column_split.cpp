@@ -8,7 +8,8 @@
 // expects data after a restart marker (empty accumulator, predictors 0) and
 // the join writes the markers. The block coder's own restart insertion, which
 // counts MCUs in delivery order, is therefore suspended from set-up to join.
-#include "api/output_target.h"
+#include "sink/output_target.h"
+#include "core/band_driver.h"
 #include "core/entropy_coder.h"
 #include "incremental/incremental.h"
 
@@ -96,52 +97,22 @@ void release_row(EncoderContext* ctx, uint32_t r) {
     ctx->columns[r] = nullptr;
 }
 
-// Memory main target: one growth to the exact size of the joined stream plus
-// the bytes completion appends, then one copy of each row.
-bool join_into_memory(EncoderContext* ctx, OutputTarget* main, uint64_t row_bytes) {
+// Joins the rows into the main target: one preparation for everything that
+// follows (a memory block grows once, to the exact size of the joined
+// stream plus the bytes completion appends), then each row as the target
+// passes long runs on (copied, written to the file straight from the row's
+// buffer, or handed to a callback in work-buffer pieces), RST markers between.
+bool join_rows(EncoderContext* ctx, uint64_t row_bytes) {
     const uint32_t count = ctx->total_imcu_rows;
-    const uint64_t needed = static_cast<uint64_t>(main->used) + row_bytes + 2u * (count - 1) + 6u;
-    if (needed > kMaxMemoryStream) {
-        fail(ctx, EKO_ERR_TOO_LARGE);
-        return false;
-    }
-    if (needed > main->capacity) {
-        uint8_t* grown = eko_jpeg_enc_realloc(main->buffer, main->capacity,
-                                              static_cast<uint32_t>(needed) - main->capacity);
-        if (grown == nullptr) {
-            // The old block went with the failed growth; nothing is left to write into.
-            main->buffer = nullptr;
-            main->capacity = main->used = main->total = 0;
-            fail(ctx, EKO_ERR_ALLOC);
-            return false;
-        }
-        main->buffer = grown;
-        main->capacity = static_cast<uint32_t>(needed);
-    }
+    const Sink main = sink_of(ctx);
+    const SinkKind& kind = kind_of(main.target);
+    if (!kind.reserve(main, row_bytes + 2u * (count - 1) + 6u)) return false;
     for (uint32_t r = 0; r < count; ++r) {
         const OutputTarget* t = ctx->columns[r]->row_target;
-        DORVATEKO_OsMemcpy(main->buffer + main->used, t->buffer, t->used);
-        main->used += t->used;
-        if (r + 1 < count) put_u16(main, 0xFFD0u + (r & 7u));
-        release_row(ctx, r);
-    }
-    return true;
-}
-
-// File and stream main targets: the header still waiting in the work buffer
-// goes first. A file takes each row straight from its buffer; a stream
-// callback gets the rows through the work buffer, in pieces of at most
-// 4096 bytes like the rest of the stream.
-bool join_handed_on(EncoderContext* ctx, OutputTarget* main) {
-    const uint32_t count = ctx->total_imcu_rows;
-    for (uint32_t r = 0; r < count; ++r) {
-        const OutputTarget* t = ctx->columns[r]->row_target;
-        const bool ok = main->kind == EKO_OUTPUT_FILE ? write_direct(ctx, t->buffer, t->used)
-                                                      : write_bytes(ctx, t->buffer, t->used);
-        if (!ok) return false;
+        if (!kind.write_run(main, t->buffer, t->used)) return false;
         if (r + 1 < count) {
             const uint8_t marker[2] = {0xFF, static_cast<uint8_t>(0xD0u + (r & 7u))};
-            if (!write_bytes(ctx, marker, 2)) return false;
+            if (!write_bytes(main, marker, 2)) return false;
         }
         release_row(ctx, r);
     }
@@ -159,7 +130,7 @@ int64_t flush_rows(EncoderContext* ctx) {
         load_state(es, row);
         // The pad byte and its stuffed zero.
         if (!ensure_room(ctx, 2)) return -1;
-        __eko_jpeg_enc_finish_compression(ctx);
+        pad_final_byte(ctx);
         save_state(es, row);
         total += row->row_target->used;
     }
@@ -210,7 +181,7 @@ EKO_API uint32_t __eko_jpeg_enc_col_entroy_encoder(EncoderContext* context, McuB
         save_state(es, row);
     }
     context->mcu_state->imcu_row = 0;
-    __eko_jpeg_enc_setup_imcu(context);
+    tekoj::setup_band(context);
     context->col_next_row += context->max_h_samp * 8u;
     *next_col_out = context->col_next_row;
     return 1;
@@ -238,11 +209,7 @@ EKO_API uint32_t __eko_jpeg_enc_col_encoder_finish(EncoderContext* context) {
     es->put_bits = 0;
     es->last_dc_val[0] = es->last_dc_val[1] = es->last_dc_val[2] = 0;
 
-    bool ok = row_bytes >= 0;
-    if (ok) {
-        ok = main->kind == EKO_OUTPUT_MEMORY ? join_into_memory(context, main, static_cast<uint64_t>(row_bytes))
-                                             : join_handed_on(context, main);
-    }
+    const bool ok = row_bytes >= 0 && join_rows(context, static_cast<uint64_t>(row_bytes));
     release_row_streams(context);  // whatever a failure left behind; also ends the suspension
     if (!ok) return 0;
     // Every MCU row is in the stream now: no band or column may follow.

@@ -8,8 +8,10 @@
 // stream target without its callback) write nothing and leave the encode as
 // it was.
 #include "api/context.h"
-#include "api/output_target.h"
+#include "sink/output_target.h"
 #include "core/band_driver.h"
+#include "core/header_writer.h"
+#include "input/formats.h"
 #include "incremental/incremental.h"
 
 namespace tekoj {
@@ -22,7 +24,8 @@ namespace {
 // horizontally, or doubled vertically) would read past the caller's buffer.
 // 4:2:0, 4:2:2 and single-component images fit.
 bool band_regions_fit(const EncoderContext* ctx) {
-    if (ctx->format != EKO_FORMAT_YUV420) return true;  // grey reads 8 luma rows; RGB reads no band buffer
+    const FormatTraits* format = format_traits(ctx->format);
+    if (!format->planar || format->components == 1) return true;  // grey reads 8 luma rows; RGB reads no band buffer
     const uint64_t w = static_cast<uint64_t>(ctx->width);
     const uint64_t chroma = ((w + 1) >> 1) * 8;
     const uint64_t region[3] = {w * 16, chroma, chroma};
@@ -34,9 +37,7 @@ bool band_regions_fit(const EncoderContext* ctx) {
 }
 
 // Formats whose reader takes its samples from the band buffer.
-bool reads_band_buffer(const EncoderContext* ctx) {
-    return ctx->format == EKO_FORMAT_YUV420 || ctx->format == EKO_FORMAT_GREY;
-}
+bool reads_band_buffer(const EncoderContext* ctx) { return format_traits(ctx->format)->planar; }
 
 uint32_t band_call(EncoderContext* ctx, const uint8_t* band, uint32_t* next_row_out) {
     eko_SetError(EKO_OK);
@@ -108,14 +109,14 @@ extern "C" {
 EKO_API EncoderContext* eko_jpeg_enc_mcu_init(const ImageInfo* image_info, const OutputRequest* output_request,
                                               const EncodeOptions* options, const EncoderSettings* settings) {
     eko_SetError(EKO_OK);
-    EncoderContext* ctx = __eko_jpeg_enc_initiaize(image_info, output_request, options, settings);
+    EncoderContext* ctx = tekoj::create_context(image_info, output_request, options, settings);
     if (ctx == nullptr) return nullptr;
     // The EXIF pointer stays null: this interface never writes APP1. A header
     // that could not be written (a memory block that failed to grow, which
     // also frees the caller's block) leaves the context failed rather than
     // returning null, so that the caller learns from the finish call that
     // the block is gone instead of freeing it a second time.
-    __eko_jpeg_enc_make_header(ctx);
+    tekoj::write_header(ctx);
     return ctx;
 }
 
@@ -171,7 +172,7 @@ EKO_API void eko_jpeg_enc_mcu_finish(EncoderContext* context, uint8_t** buffer_o
         release_row_streams(context);
         fail(context, EKO_ERR_STATE);
     }
-    if (context->failed == 0 && context->finished == 0) __eko_jpeg_enc_make_end_mark(context);
+    if (context->failed == 0 && context->finished == 0) tekoj::complete_stream(context, true);
 
     OutputTarget* t = context->output;
     uint8_t* buffer = nullptr;

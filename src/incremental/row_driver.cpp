@@ -1,7 +1,8 @@
 // Row entropy driver: codes one band of caller-supplied quantised
 // coefficient blocks exactly where the band driver would have coded the
 // blocks it computed itself, restart markers included.
-#include "api/output_target.h"
+#include "sink/output_target.h"
+#include "core/band_driver.h"
 #include "core/entropy_coder.h"
 #include "incremental/incremental.h"
 
@@ -23,20 +24,21 @@ uint32_t mcus_left_in_band(const EncoderContext* ctx) {
 bool band_codable(EncoderContext* ctx, const McuBlockList* mcus, uint32_t count) {
     EntropyState* es = ctx->entropy;
     const int32_t saved_dc[3] = {es->last_dc_val[0], es->last_dc_val[1], es->last_dc_val[2]};
-    const int32_t saved_count = ctx->restart_mcu_count;
-    const bool restarts = ctx->restart_interval != 0 && ctx->restart_suspended == 0;
+    const RestartClock saved_clock = load_restart(ctx);
+    RestartClock clock = saved_clock;
     bool ok = true;
     for (uint32_t k = 0; k < count; ++k) {
         int16_t* const* blocks = mcus[k].blocks;
         ok = mcu_codable(ctx, blocks);
         if (!ok) break;
-        if (restarts) ctx->restart_mcu_count = ctx->restart_mcu_count == -1 ? 1 : ctx->restart_mcu_count + 1;
+        clock.tick();
+        store_restart(ctx, clock);
         // Every scan component owns at least one block of the MCU, so this
         // leaves each predictor at the value the coder will leave.
         for (uint32_t n = 0; n < ctx->blocks_in_mcu; ++n) es->last_dc_val[ctx->mcu_membership[n]] = blocks[n][0];
     }
     for (int c = 0; c < 3; ++c) es->last_dc_val[c] = saved_dc[c];
-    ctx->restart_mcu_count = saved_count;
+    store_restart(ctx, saved_clock);
     return ok;
 }
 
@@ -57,7 +59,7 @@ uint32_t code_band(EncoderContext* ctx, McuBlockList* mcus, uint32_t* next_row_o
         st->mcu_ctr = 0;
     }
     ++st->imcu_row;
-    __eko_jpeg_enc_setup_imcu(ctx);
+    tekoj::setup_band(ctx);
     ctx->next_row = static_cast<uint16_t>(ctx->next_row + ctx->max_v_samp * 8u);
     *next_row_out = ctx->next_row;
     return 1;

@@ -1,13 +1,16 @@
 // Input readers: fill one band of component sample rows from the caller's
-// pixels, in the layout that the context's format code names.
+// pixels, in the layout that the context's format code names. The reader of
+// each format is found through its entry in the format table.
 #pragma once
 
 #include <TekoJEncoderInternal.h>
 
+#include "input/formats.h"
+
 namespace tekoj {
 
 // Runs the reader of the context's format for the current band.
-void read_band(EncoderContext* ctx);
+inline void read_band(EncoderContext* ctx) { format_traits(ctx->format)->read(ctx); }
 
 // Where a reader starts: the read positions that creation gave a context.
 struct ReadOrigin {

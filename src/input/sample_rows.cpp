@@ -73,20 +73,9 @@ EKO_API uint32_t __eko_jpeg_enc_get_raw_pvu_data(EncoderContext* context) {
 
 namespace tekoj {
 
-void read_band(EncoderContext* ctx) {
-    switch (ctx->format) {
-        case EKO_FORMAT_YUV420:
-        case EKO_FORMAT_GREY: __eko_jpeg_enc_get_raw_data(ctx); break;
-        case EKO_FORMAT_RGB565: __eko_jpeg_enc_get_raw_rgb565_data(ctx); break;
-        case EKO_FORMAT_RGB888: __eko_jpeg_enc_get_raw_rgb888_data(ctx); break;
-        case EKO_FORMAT_RGBA8888: __eko_jpeg_enc_get_raw_rgba8888_data(ctx); break;
-        case EKO_FORMAT_BGRA8888: __eko_jpeg_enc_get_raw_bgra8888_data(ctx); break;
-        default: break;
-    }
-}
-
 void seek_band(EncoderContext* ctx, const ReadOrigin& origin, uint32_t band) {
-    if (ctx->format == EKO_FORMAT_YUV420 || ctx->format == EKO_FORMAT_GREY) {
+    const FormatTraits* format = format_traits(ctx->format);
+    if (format->planar) {
         // Each earlier band took band_rows rows of every component's plane.
         const uint8_t** planes[3] = {&ctx->plane_y, &ctx->plane_u, &ctx->plane_v};
         for (uint32_t c = 0; c < ctx->num_components && c < 3; ++c) {
@@ -96,7 +85,7 @@ void seek_band(EncoderContext* ctx, const ReadOrigin& origin, uint32_t band) {
         }
         return;
     }
-    const size_t bytes_per_pixel = ctx->format == EKO_FORMAT_RGB565 ? 2 : ctx->format == EKO_FORMAT_RGB888 ? 3 : 4;
+    const size_t bytes_per_pixel = format->bytes_per_pixel;
     const size_t rows = static_cast<size_t>(band) * ctx->max_v_samp * 8u;
     ctx->read_ptr = origin.read_ptr + rows * static_cast<size_t>(ctx->width) * bytes_per_pixel;
 }
