@@ -174,8 +174,10 @@ typedef struct OutputRequest {
 
 /* Optional settings of the MCU-row interface (the whole-image entry points
  * always use the built-in layout): component count, own quantisation tables
- * and sampling factors. Planar YUV input accepts 4:2:0 (Y 2x2), 4:2:2 (Y 2x1)
- * or 4:4:4 (all 1x1); RGB input only 4:2:0. */
+ * and sampling factors. The band call's buffer holds 4:2:0 (Y 2x2) and 4:2:2
+ * (Y 2x1) planar input and grey; other samplings (4:4:4) are for the
+ * column-split drivers, which take ready coefficients (the band call refuses
+ * them with EKO_ERR_SAMPLING). RGB input is always 4:2:0. */
 typedef struct EncoderSettings {
     uint8_t num_components;         /* 1 (grey) or 3 */
     uint8_t reserved0[3];
