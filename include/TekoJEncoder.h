@@ -174,8 +174,10 @@ typedef struct OutputRequest {
 
 /* Optional settings of the MCU-row interface (the whole-image entry points
  * always use the built-in layout): component count, own quantisation tables
- * and sampling factors. Planar YUV input accepts 4:2:0 (Y 2x2), 4:2:2 (Y 2x1)
- * or 4:4:4 (all 1x1); RGB input only 4:2:0. */
+ * and sampling factors. The band call's buffer holds 4:2:0 (Y 2x2) and 4:2:2
+ * (Y 2x1) planar input and grey; other samplings (4:4:4) are for the
+ * column-split drivers, which take ready coefficients (the band call refuses
+ * them with EKO_ERR_SAMPLING). RGB input is always 4:2:0. */
 typedef struct EncoderSettings {
     uint8_t num_components;         /* 1 (grey) or 3 */
     uint8_t reserved0[3];
@@ -351,8 +353,13 @@ EKO_API uint32_t eko_enc_jpeg_to_stream_ex(const ImageInfo* image_info, EkoStrea
  * eko_jpeg_enc_mcu_init creates the encoder and writes the header. Output:
  * kind 1 takes a DORVATEKO_OsMalloc block that the encoder owns (and may
  * replace) until finish hands it back; kind 0 a handle the caller opened and
- * closes after finish; kind 4 needs eko_jpeg_enc_mcu_set_stream before the
- * first band. settings may be null (4:2:0, or grey for EKO_FORMAT_GREY).
+ * closes after finish (the C library may hold the stream's tail until then,
+ * so a close that fails, a full disc for one, means the file is incomplete
+ * even though finish reported the length); kind 4 needs
+ * eko_jpeg_enc_mcu_set_stream before the first band. settings may be null
+ * (4:2:0, or grey for EKO_FORMAT_GREY). Samplings whose rows do not fit the
+ * band layout below (4:4:4, chroma doubled vertically) are accepted here
+ * for the coefficient drivers and refused by the band calls (EKO_ERR_SAMPLING).
  *
  * eko_jpeg_enc_muc_process (and its twin eko_jpeg_enc_col_muc_process) codes
  * the next band, top to bottom, and stores the rows consumed so far in

@@ -274,7 +274,7 @@ Summary encode(Source& src, const Options& o, Output& out, const std::function<v
             for (uint32_t top = 0; top < h; top += band_rows)
                 src.read_rows(whole.data() + size_t{row_bytes(layout, w)} * top, std::min(band_rows, h - top));
         }
-        encode_rows_parallel(rows_fit ? whole.data() : fy, w, h, summary.grey ? EKO_FORMAT_GREY : format, o.quality,
+        encode_rows_parallel(rows_fit ? whole.data() : fy, w, h, summary.grey ? uint32_t{EKO_FORMAT_GREY} : format, o.quality,
                              std::min(threads, 64u), state);
         progress(1.0);
         splicer->finish();

@@ -59,10 +59,9 @@ bool allocate_band_rows(EncoderContext* ctx) {
 
 void release_band_rows(EncoderContext* ctx) {
     for (uint32_t c = 0; c < ctx->num_components && c < 3; ++c) {
+        // The row array and its rows are one block.
         uint8_t** rows = ctx->sample_rows->row_arrays[c];
-        if (rows == nullptr) continue;
-        for (uint32_t r = 0; r < ctx->comp_info[c].band_rows; ++r) DORVATEKO_OsFree(rows[r]);
-        DORVATEKO_OsFree(rows);
+        if (rows != nullptr) DORVATEKO_OsFree(rows);
         ctx->sample_rows->row_arrays[c] = nullptr;
     }
 }

@@ -1,9 +1,17 @@
 // Forward DCT with quantisation: the scaled integer AAN transform in 8-bit
 // fixed point; the transform's output scale lives in the reciprocal divisors,
 // so each coefficient costs one multiply and one shift.
+//
+// Range facts the fast paths rest on (interval bounds over every sample block
+// of 0..255, checked by the equivalence tests): every intermediate of both
+// passes, and every column-pass output x, satisfies |x| <= 21914 and so fits
+// 16 bits; with a divisor word m <= 65536 the product x * m fits 32 bits
+// (|x * m| < 2^31) and the coefficient fits 16 bits.
 #pragma once
 
 #include <TekoJEncoderInternal.h>
+
+#include "core/simd_level.h"
 
 #include <cstdint>
 
@@ -42,23 +50,68 @@ inline void butterfly(const In* in, int step, int32_t* out, int out_step) {
     out[7 * out_step] = z11 - z4;
 }
 
-// Positive values truncate, negative ones round to nearest (ties up).
-inline int16_t quantise(int32_t x, uint32_t divisor) {
+// Positive values truncate, negative ones round to nearest (ties up). Any
+// 32-bit divisor word: the product is taken in 64 bits.
+inline int16_t quantise_wide(int32_t x, uint32_t divisor) {
     const int64_t p = static_cast<int64_t>(x) * static_cast<int64_t>(divisor);
     return static_cast<int16_t>(x >= 0 ? (p >> 16) : ((p + 32768) >> 16));
 }
 
+// The same for divisor words up to 65536, where the product fits 32 bits.
+inline int16_t quantise(int32_t x, uint32_t divisor) {
+    const int32_t p = x * static_cast<int32_t>(divisor);
+    return static_cast<int16_t>((p + ((x >> 31) & 32768)) >> 16);
+}
+
+// One block: row pass, column pass, then quant(i, x) for each output x at
+// natural index i.
+template <typename Quant>
+inline void block(const uint8_t* const* rows, uint32_t col, Quant quant, int16_t* out) {
+    int32_t work[64];
+    for (int y = 0; y < 8; ++y) butterfly<512>(rows[y] + col, 1, work + 8 * y, 1);
+    int32_t col_out[64];
+    for (int u = 0; u < 8; ++u) butterfly<0>(work + u, 8, col_out + u, 8);
+    for (int i = 0; i < 64; ++i) out[i] = quant(i, col_out[i]);
+}
+
 }  // namespace dct_detail
 
-// Transforms and quantises the 8x8 block whose top-left sample is
-// rows[row][col], into 64 coefficients in natural order.
-inline void forward_dct_block(uint8_t* const* rows, uint32_t row, uint32_t col, const uint32_t* divisors,
-                              int16_t* out) {
-    int32_t work[64];
-    for (int y = 0; y < 8; ++y) dct_detail::butterfly<512>(rows[row + y] + col, 1, work + 8 * y, 1);
-    int32_t col_out[64];
-    for (int u = 0; u < 8; ++u) dct_detail::butterfly<0>(work + u, 8, col_out + u, 8);
-    for (int i = 0; i < 64; ++i) out[i] = dct_detail::quantise(col_out[i], divisors[i]);
-}
+// The largest divisor word the transform kernels accept; every table the
+// library builds stays within it (65536 / d for an integer d >= 1).
+constexpr uint32_t kMaxKernelDivisor = 65536;
+
+// One quantisation table in the forms the kernels use, built per band from
+// the 32-bit divisor words: `divisors` itself (portable, NEON), and for the
+// 16-bit lanes of SSE2/AVX2 the low half of each word (`mul`) and a mask
+// that is all ones where the word is 32768 or more (`wide`): then
+// x * m = x * int16(mul) + (x & wide) * 65536.
+struct QuantTable {
+    const uint32_t* divisors;
+    alignas(32) int16_t mul[64];
+    alignas(32) int16_t wide[64];
+};
+
+void prepare_quant_table(const uint32_t* divisors, QuantTable& table);
+
+// Transforms and quantises `count` horizontally adjacent blocks whose
+// top-left samples are rows[0][col + 8 b], into count consecutive blocks of 64
+// coefficients in natural order. `rows` points at the block row's first row
+// pointer. Every divisor word must be at most kMaxKernelDivisor.
+using FdctBlocksFn = void (*)(const uint8_t* const* rows, uint32_t col, uint32_t count, const QuantTable& quant,
+                              int16_t* out);
+
+// The kernel of a dispatch level (the portable one for levels this build or
+// processor lacks), and the one of the process's level.
+FdctBlocksFn fdct_blocks_for(SimdLevel level);
+FdctBlocksFn fdct_blocks();
+
+void fdct_blocks_portable(const uint8_t* const* rows, uint32_t col, uint32_t count, const QuantTable& quant,
+                          int16_t* out);
+void fdct_blocks_sse2(const uint8_t* const* rows, uint32_t col, uint32_t count, const QuantTable& quant,
+                      int16_t* out);
+void fdct_blocks_avx2(const uint8_t* const* rows, uint32_t col, uint32_t count, const QuantTable& quant,
+                      int16_t* out);
+void fdct_blocks_neon(const uint8_t* const* rows, uint32_t col, uint32_t count, const QuantTable& quant,
+                      int16_t* out);
 
 }  // namespace tekoj

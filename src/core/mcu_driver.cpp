@@ -25,6 +25,15 @@ bool compress_band(EncoderContext* ctx, uint8_t** const* row_arrays) {
     const uint32_t last_col = ctx->mcus_per_row - 1;
     const uint32_t last_band = ctx->total_imcu_rows - 1;
     int16_t* const* mcu = st->mcu_buffer;
+    // The transform kernel of the process's SIMD level, and the scan's
+    // quantisation tables in the forms it takes (prepared once per band).
+    const FdctBlocksFn fdct = fdct_blocks();
+    QuantTable quant[4];
+    for (QuantTable& q : quant) q.divisors = nullptr;
+    for (int c = 0; c < ctx->comps_in_scan; ++c) {
+        const uint8_t t = ctx->cur_comp_info[c]->quant_tbl_no;
+        if (quant[t].divisors != ctx->divisors[t]) prepare_quant_table(ctx->divisors[t], quant[t]);
+    }
     // One coder for the whole band: the accumulator carries over from MCU to
     // MCU and is written out a whole word at a time.
     RowCoder coder;
@@ -38,11 +47,10 @@ bool compress_band(EncoderContext* ctx, uint8_t** const* row_arrays) {
                 const uint32_t start_col = x * comp->mcu_sample_width;
                 uint32_t start_row = y * 8;
                 uint8_t* const* rows = row_arrays[comp->component_index];
-                const uint32_t* divisors = ctx->divisors[comp->quant_tbl_no];
+                const QuantTable& q = quant[comp->quant_tbl_no];
                 for (uint32_t r = 0; r < comp->mcu_height; ++r) {
                     if (st->imcu_row < last_band || y + r < comp->last_row_height) {
-                        for (uint32_t j = 0; j < count; ++j)
-                            forward_dct_block(rows, start_row, start_col + 8 * j, divisors, mcu[blkn + j]);
+                        fdct(rows + start_row, start_col, count, q, mcu[blkn]);
                         for (uint32_t j = count; j < comp->mcu_width; ++j)
                             dummy_block(mcu[blkn + j], mcu[blkn + j - 1][0]);
                     } else {

@@ -2,26 +2,24 @@
 // plane followed by an interleaved V/U plane).
 #include "input/edge_fill.h"
 #include "input/readers.h"
+#include "input/sample_row_layout.h"
+#include "input/vu_split.h"
 
 extern "C" {
 
 EKO_API uint8_t** __eko_jpeg_enc_alloc_sample_arry(EncoderContext* context, uint32_t row_length,
                                                    uint32_t row_count) {
     (void)context;
-    auto** rows = static_cast<uint8_t**>(DORVATEKO_OsMalloc(row_count * static_cast<uint32_t>(sizeof(uint8_t*))));
-    if (rows == nullptr) {
+    // One block: the row pointers, then the rows at a fixed aligned stride.
+    const tekoj::SampleRowLayout layout = tekoj::sample_row_layout(row_length, row_count);
+    auto* block = static_cast<uint8_t*>(DORVATEKO_OsMalloc(layout.block_size));
+    if (block == nullptr) {
         eko_SetError(EKO_ERR_ALLOC);
         return nullptr;
     }
-    for (uint32_t r = 0; r < row_count; ++r) {
-        rows[r] = static_cast<uint8_t*>(DORVATEKO_OsMalloc(row_length));
-        if (rows[r] == nullptr) {
-            for (uint32_t k = 0; k < r; ++k) DORVATEKO_OsFree(rows[k]);
-            DORVATEKO_OsFree(rows);
-            eko_SetError(EKO_ERR_ALLOC);
-            return nullptr;
-        }
-    }
+    auto** rows = reinterpret_cast<uint8_t**>(block);
+    uint8_t* first = tekoj::first_sample_row(rows, row_count);
+    for (uint32_t r = 0; r < row_count; ++r) rows[r] = first + static_cast<size_t>(r) * layout.stride;
     return rows;
 }
 
@@ -56,13 +54,10 @@ EKO_API uint32_t __eko_jpeg_enc_get_raw_pvu_data(EncoderContext* context) {
     uint8_t* const* cbrows = context->sample_rows->row_arrays[1];
     uint8_t* const* crrows = context->sample_rows->row_arrays[2];
     const uint32_t n = cb.downsampled_width;
+    static const tekoj::SplitVuFn split = tekoj::split_vu_for(tekoj::simd_level());
     for (uint32_t r = 0; r < cb.rows_this_band; ++r) {
-        const uint8_t* src = context->plane_v;
+        split(context->plane_v, n, crrows[r], cbrows[r]);  // V comes first in each pair
         context->plane_v += 2 * static_cast<size_t>(n);
-        for (uint32_t x = 0; x < n; ++x) {
-            crrows[r][x] = src[2 * x];      // V comes first in each pair
-            cbrows[r][x] = src[2 * x + 1];
-        }
     }
     tekoj::fill_component_edges(cbrows, cb, n, cb.rows_this_band);
     tekoj::fill_component_edges(crrows, cr, n, cb.rows_this_band);
@@ -72,6 +67,24 @@ EKO_API uint32_t __eko_jpeg_enc_get_raw_pvu_data(EncoderContext* context) {
 }  // extern "C"
 
 namespace tekoj {
+
+void split_vu_portable(const uint8_t* src, uint32_t n, uint8_t* cr, uint8_t* cb) {
+    for (uint32_t x = 0; x < n; ++x) {
+        cr[x] = src[2 * x];
+        cb[x] = src[2 * x + 1];
+    }
+}
+
+SplitVuFn split_vu_for(SimdLevel level) {
+    if (!simd_supported(level)) return split_vu_portable;
+#if defined(__x86_64__) || (defined(__i386__) && defined(__SSE2__))
+    if (level == SimdLevel::sse2 || level == SimdLevel::avx2 || level == SimdLevel::avx512) return split_vu_sse2;
+#endif
+#if defined(__arm__) || defined(__aarch64__)
+    if (level == SimdLevel::neon) return split_vu_neon;
+#endif
+    return split_vu_portable;
+}
 
 void seek_band(EncoderContext* ctx, const ReadOrigin& origin, uint32_t band) {
     const FormatTraits* format = format_traits(ctx->format);
