@@ -20,7 +20,7 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
     const Bytes px = in.fill(image_bytes(format, w, h));
     const ImageInfo info{w, h, in.flag() ? px.data() : nullptr, 0, 0, 0, 0, 0, format, nullptr};
     void* file = kind == EKO_OUTPUT_FILE ? DORVATEKO_OsFopen("/dev/null", "wb") : nullptr;
-    const uint32_t start = in.u8() % 2 ? in.range(1, 3000) : 0;
+    const uint32_t start = in.u8() % 2 && kind == EKO_OUTPUT_MEMORY ? in.range(1, 3000) : 0;
     uint8_t* block = start ? static_cast<uint8_t*>(DORVATEKO_OsMalloc(start)) : nullptr;
     const OutputRequest request{kind, file, block, start};
     const EncodeOptions options{in.range(0, 101), nullptr, 0};
@@ -37,13 +37,18 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
     const uint32_t rows = ctx->total_imcu_rows, per_row = ctx->mcus_per_row, count = rows > per_row ? rows : per_row;
     std::vector<int16_t> coefficients(size_t(count) * 10 * 64);
     std::vector<McuBlockList> lists(count);
+    for (uint32_t k = 0; k < count; ++k)
+        for (int b = 0; b < 10; ++b) lists[k].blocks[b] = &coefficients[(size_t(k) * 10 + b) * 64];
     for (int step = 0; step < 64 && in.left() > 0; ++step) {
         uint32_t next = 0;
         const uint32_t op = in.u8() % 9;
-        if (op <= 3) {  // fresh coefficients for the next row or column call
-            for (auto& c : coefficients) c = in.flag() ? 0 : int16_t(int(in.u16() % 4096) - 2048) >> (in.u8() % 8);
-            for (uint32_t k = 0; k < count; ++k)
-                for (int b = 0; b < 10; ++b) lists[k].blocks[b] = &coefficients[(size_t(k) * 10 + b) * 64];
+        if (op <= 3) {  // fresh coefficients for the next row or column call: mostly 0, some too large
+            uint32_t seed = in.u16();
+            const uint32_t shift = in.u8() % 12;
+            for (auto& c : coefficients) {
+                seed = seed * 1664525u + 1013904223u;
+                c = (seed >> 28) < 10 ? 0 : int16_t((int32_t((seed >> 8) % 4096) - 2048) >> shift);
+            }
         }
         switch (op) {
             case 0: eko_jpeg_enc_muc_process(ctx, band.data(), &next); break;
@@ -61,6 +66,20 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
             }
             default: __OvidanJpegEncEntroyEncoder(ctx, lists.data(), &next);
         }
+    }
+    // Mostly finish the job as a careful caller would, so that whole streams
+    // are decoded: the remaining columns and the join, or the remaining rows
+    // by bands and by the row driver in turn; small coefficients.
+    if (in.u8() % 4 != 3) {
+        for (size_t k = 0; k < coefficients.size(); ++k) coefficients[k] = int16_t(int(k * 2654435761u >> 28) - 8);
+        uint32_t next = 0;
+        for (uint32_t col = 0; ctx->columns != nullptr && col < per_row; ++col)
+            __eko_jpeg_enc_col_entroy_encoder(ctx, lists.data(), &next);
+        __eko_jpeg_enc_col_encoder_finish(ctx);
+        for (uint32_t row = 0; row < rows; ++row)
+            if ((row % 2 ? eko_jpeg_enc_muc_process(ctx, band.data(), &next)
+                         : __eko_jpeg_enc_entroy_encoder(ctx, lists.data(), &next)) == 0)
+                break;
     }
     const bool complete = ctx->mcu_state->imcu_row >= ctx->total_imcu_rows && ctx->columns == nullptr;
     uint8_t* out = nullptr;

@@ -88,13 +88,21 @@ inline size_t image_bytes(uint32_t format, int w, int h) {
 // A random EncoderSettings record: mostly plausible, sometimes not.
 inline EncoderSettings settings_from(Input& in) {
     EncoderSettings s{};
-    s.num_components = uint8_t(in.flag() ? 3 : in.range(0, 4));
-    s.num_quant_tables = int32_t(in.range(0, 5)) - (in.u8() == 0 ? 1 : 0);
+    const bool odd = in.u8() % 8 == 0;  // one record in eight may be anything
+    s.num_components = uint8_t(odd ? in.range(0, 4) : in.flag() ? 3 : 1);
+    s.num_quant_tables = odd ? int32_t(in.range(0, 5)) - 1 : int32_t(in.range(2, 4));
+    // Tables from two bytes, so that the record leaves the input for the rest.
+    const uint32_t base = in.u8(), step = in.u8();
     for (int t = 0; t < 4; ++t)
-        for (int i = 0; i < 64; ++i) s.quant_tables[t][i] = uint8_t(in.flag() ? 1 + in.u8() % 50 : in.u8());
+        for (uint32_t i = 0; i < 64; ++i)
+            s.quant_tables[t][i] = uint8_t(odd ? (base + i * step * (t + 1)) & 0xFF : 1 + (base + i * step + t) % 60);
     s.write_dri = in.u8() % 4 != 0;
     s.size_estimate = in.flag() ? in.u32() : in.range(0, 20000);
-    for (auto& c : s.component_specs) c[0] = uint8_t(in.range(0, 2)), c[1] = uint8_t(in.range(0, 3)), c[2] = uint8_t(in.range(0, 3));
+    for (auto& c : s.component_specs) {
+        c[0] = uint8_t(in.range(0, odd ? 4 : 1));
+        c[1] = uint8_t(in.range(odd ? 0 : 1, odd ? 3 : 2)), c[2] = uint8_t(in.range(odd ? 0 : 1, odd ? 3 : 2));
+    }
+    if (!odd && s.num_components == 1) s.component_specs[0][0] = 0;
     return s;
 }
 

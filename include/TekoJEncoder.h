@@ -353,8 +353,13 @@ EKO_API uint32_t eko_enc_jpeg_to_stream_ex(const ImageInfo* image_info, EkoStrea
  * eko_jpeg_enc_mcu_init creates the encoder and writes the header. Output:
  * kind 1 takes a DORVATEKO_OsMalloc block that the encoder owns (and may
  * replace) until finish hands it back; kind 0 a handle the caller opened and
- * closes after finish; kind 4 needs eko_jpeg_enc_mcu_set_stream before the
- * first band. settings may be null (4:2:0, or grey for EKO_FORMAT_GREY).
+ * closes after finish (the C library may hold the stream's tail until then,
+ * so a close that fails, a full disc for one, means the file is incomplete
+ * even though finish reported the length); kind 4 needs
+ * eko_jpeg_enc_mcu_set_stream before the first band. settings may be null
+ * (4:2:0, or grey for EKO_FORMAT_GREY). Samplings whose rows do not fit the
+ * band layout below (4:4:4, chroma doubled vertically) are accepted here
+ * for the coefficient drivers and refused by the band calls (EKO_ERR_SAMPLING).
  *
  * eko_jpeg_enc_muc_process (and its twin eko_jpeg_enc_col_muc_process) codes
  * the next band, top to bottom, and stores the rows consumed so far in

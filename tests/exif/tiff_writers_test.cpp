@@ -44,7 +44,8 @@ TEST(TiffWriters, EachWriterFillsOneEntryAndItsDataArea) {
 // length 0 leave their entries out, one non-zero word of a rational is
 // enough, and the three bytes of "XY" put the resolution at an odd offset.
 TEST(ExifBlock, ExactBlocks) {
-    ExifInfo empty{}, with_gps{}, odd{};
+    ExifInfo empty{}, with_gps{}, odd{}, four{};
+    four.make = "XYZ";  // with its NUL exactly the four bytes that stand in the entry
     GpsInfo g{}, h{};
     with_gps.gps = &g;
     odd.make = "XY", odd.x_resolution = {72, 1}, odd.focal_length = {0, 10}, odd.has_thumbnail = 1, odd.gps = &h;
@@ -59,10 +60,12 @@ TEST(ExifBlock, ExactBlocks) {
                             "2588 0400 01000000 6F000000 99000000 585900 48000000 01000000 0200 0A92 0500 01000000 "
                             "67000000 " + white_balance + "00000000 0A000000 0100 0200 0500 03000000 81000000 00000000 "
                             "00000000 00000000 00000000 00000000 05000000 01000000 0100 0102 0400 01000000 AB000000 "
-                            "00000000 "}}) {
+                            "00000000 "},
+          Case{&four, head + "0200 0F01 0200 04000000 58595A00 6987 0400 01000000 2A000000 00000000 58595A00 0100 " +
+                          white_balance}}) {
         const Bytes want = hex(text + "AA");
         Bytes b(256, 0xAA);
-        ASSERT_EQ(__eko_CreateExif(b.data(), e), want.size() - 1);  // 44, 74 and 171
+        ASSERT_EQ(__eko_CreateExif(b.data(), e), want.size() - 1);  // 44, 74, 171 and 60
         EXPECT_EQ(Bytes(b.begin(), b.begin() + want.size()), want);
         EXPECT_EQ(tekoj::exif_block_size(e), want.size() - 1);
     }
