@@ -77,10 +77,9 @@ inline void flush_whole_bytes(BitState& w) {
     w.free = kAccBits - pending;
 }
 
-// One value with its magnitude category: puts the table entry for `symbol`
-// (whose low four bits are the category when `k_in_symbol`) with the extra
-// bits: the value itself when positive, the one's complement of its
-// magnitude when negative.
+// One value of magnitude category k: the combined table entry (code already
+// shifted left by k) with the k extra bits, the value itself when positive,
+// the one's complement of its magnitude when negative.
 inline void put_coded(BitState& w, uint32_t entry, int32_t x, int k) {
     const uint32_t extra = static_cast<uint32_t>(x + (x >> 31)) & ((1u << k) - 1);
     put(w, (entry >> 5) | extra, static_cast<int>(entry & 31));

@@ -50,6 +50,35 @@ EKO_API extern constexpr uint8_t eko_EnRangeTalbe[1024] = {TEKOJ_T256(clamp_entr
 
 }  // extern "C"
 
+namespace {
+
+// The converters' own copy of the tables in one object: one base register
+// reaches all five, which on 32-bit ARM leaves the pixel loop registers that
+// five separately addressed (interposable) exported arrays would take.
+struct Tables {
+    int32_t crr[256], cbb[256], crg[256], cbg[256];
+    uint8_t range[1024];
+};
+constexpr Tables kTables = {{TEKOJ_T256(red_from_cr, 0)},
+                            {TEKOJ_T256(blue_from_cb, 0)},
+                            {TEKOJ_T256(green_from_cr, 0)},
+                            {TEKOJ_T256(green_from_cb, 0)},
+                            {TEKOJ_T256(clamp_entry, 0), TEKOJ_T256(clamp_entry, 256), TEKOJ_T256(clamp_entry, 512),
+                             TEKOJ_T256(clamp_entry, 768)}};
+
+constexpr bool same_as_exported() {
+    for (int i = 0; i < 256; ++i)
+        if (kTables.crr[i] != eko_EnCrrTab[i] || kTables.cbb[i] != eko_EnCbbTab[i] || kTables.crg[i] != eko_EnCrgTab[i] ||
+            kTables.cbg[i] != eko_EnCbgTab[i])
+            return false;
+    for (int k = 0; k < 1024; ++k)
+        if (kTables.range[k] != eko_EnRangeTalbe[k]) return false;
+    return true;
+}
+static_assert(same_as_exported());
+
+}  // namespace
+
 #undef TEKOJ_T256
 #undef TEKOJ_T64
 #undef TEKOJ_T16
@@ -66,7 +95,7 @@ static_assert(eko_EnRangeTalbe[0] == 0 && eko_EnRangeTalbe[512] == 0 && eko_EnRa
 
 // Luma plus any contribution lies in -225..482, well inside the clamp table
 // once it is addressed from its middle.
-constexpr const uint8_t* kClamp = eko_EnRangeTalbe + 512;
+constexpr const uint8_t* kClamp = kTables.range + 512;
 
 // The three per-chroma-sample offsets, looked up once per 2x2 block.
 struct Chroma {
@@ -76,7 +105,7 @@ struct Chroma {
 };
 
 inline Chroma chroma_of(uint8_t cb, uint8_t cr) {
-    return {eko_EnCrrTab[cr], (eko_EnCrgTab[cr] + eko_EnCbgTab[cb]) >> 16, eko_EnCbbTab[cb]};
+    return {kTables.crr[cr], (kTables.crg[cr] + kTables.cbg[cb]) >> 16, kTables.cbb[cb]};
 }
 
 inline uint16_t pixel_of(uint8_t luma, const Chroma& c) {
@@ -87,39 +116,45 @@ inline uint16_t pixel_of(uint8_t luma, const Chroma& c) {
     return static_cast<uint16_t>(((r >> 3) << 11) | ((g >> 2) << 5) | (b >> 3));
 }
 
-// Where the Cb/Cr pair of chroma sample k of a chroma row lives: in two
-// planes, or as the pair V, U of an interleaved row.
+// Where the Cb/Cr pair of each chroma sample of a chroma row lives: in two
+// planes, or as the pair V, U of an interleaved row. `next` returns the
+// contributions of the next sample, left to right.
 struct PlanarRow {
     const uint8_t* u;  // Cb
     const uint8_t* v;  // Cr
-    Chroma at(size_t k) const { return chroma_of(u[k], v[k]); }
+    Chroma next() { return chroma_of(*u++, *v++); }
 };
 
 struct InterleavedRow {
     const uint8_t* vu;
-    Chroma at(size_t k) const { return chroma_of(vu[2 * k + 1], vu[2 * k]); }
+    Chroma next() {
+        const Chroma c = chroma_of(vu[1], vu[0]);
+        vu += 2;
+        return c;
+    }
 };
 
 // Converts the luma row(s) that share one chroma row: two rows for every row
-// pair, one for the last row of an odd height.
+// pair, one for the last row of an odd height. The pointers walk rather than
+// being indexed, which leaves the loop registers enough on 32-bit ARM.
 template <bool TwoRows, typename ChromaRow>
-inline void convert_rows(const ChromaRow& chroma, const uint8_t* y0, const uint8_t* y1, uint16_t* d0, uint16_t* d1,
+inline void convert_rows(ChromaRow chroma, const uint8_t* y0, const uint8_t* y1, uint16_t* d0, uint16_t* d1,
                          size_t width) {
-    const size_t pairs = width >> 1;
-    for (size_t k = 0; k < pairs; ++k) {
-        const Chroma c = chroma.at(k);
-        d0[2 * k] = pixel_of(y0[2 * k], c);
-        d0[2 * k + 1] = pixel_of(y0[2 * k + 1], c);
+    for (const uint8_t* const end = y0 + (width & ~size_t{1}); y0 != end; y0 += 2, d0 += 2) {
+        const Chroma c = chroma.next();
+        d0[0] = pixel_of(y0[0], c);
+        d0[1] = pixel_of(y0[1], c);
         if constexpr (TwoRows) {
-            d1[2 * k] = pixel_of(y1[2 * k], c);
-            d1[2 * k + 1] = pixel_of(y1[2 * k + 1], c);
+            d1[0] = pixel_of(y1[0], c);
+            d1[1] = pixel_of(y1[1], c);
+            y1 += 2, d1 += 2;
         }
     }
     if (width & 1) {
         // An odd width leaves a last chroma column that serves one pixel column.
-        const Chroma c = chroma.at(pairs);
-        d0[width - 1] = pixel_of(y0[width - 1], c);
-        if constexpr (TwoRows) d1[width - 1] = pixel_of(y1[width - 1], c);
+        const Chroma c = chroma.next();
+        d0[0] = pixel_of(y0[0], c);
+        if constexpr (TwoRows) d1[0] = pixel_of(y1[0], c);
     }
 }
 
@@ -173,7 +208,7 @@ const DisplayKernels* display_kernels_for(SimdLevel level) {
         case SimdLevel::portable: return &kPortableDisplayKernels;
         case SimdLevel::sse2: return display_kernels_sse2();
         case SimdLevel::avx2:
-        case SimdLevel::avx512: return display_kernels_avx2();
+        case SimdLevel::avx512: return display_kernels_avx2();  // AVX2 already ~9x the tables
         case SimdLevel::neon: return display_kernels_neon();
     }
     return nullptr;
