@@ -20,7 +20,7 @@ export DEBIAN_FRONTEND=noninteractive
 
 ARCH_PACKAGES="libgtest-dev:armhf libjpeg62-turbo-dev:armhf libturbojpeg0-dev:armhf libpng-dev:armhf libstdc++6:armhf"
 PACKAGES="cmake g++ clang ninja-build pkg-config libgtest-dev libbenchmark-dev libjpeg-dev libturbojpeg0-dev \
-libpng-dev libimage-exiftool-perl exiv2 binutils g++-arm-linux-gnueabihf qemu-user $ARCH_PACKAGES"
+libpng-dev libimage-exiftool-perl exiv2 binutils libclang-rt-14-dev g++-arm-linux-gnueabihf qemu-user $ARCH_PACKAGES"
 missing=""
 for p in $PACKAGES; do dpkg -s "$p" >/dev/null 2>&1 || missing="$missing $p"; done
 if [ -n "$missing" ]; then
