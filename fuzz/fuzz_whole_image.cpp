@@ -121,7 +121,10 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
     uint32_t format = in.u8();
     static const uint32_t kAccepted[] = {0, 1, 2, 4, 7, 8};
     if (in.u8() % 8 != 0) format = kAccepted[format % 6];  // mostly accepted codes
-    const Bytes px = in.fill(image_bytes(format, w, h));
+    // An EncoderSettings record may choose other samplings than 4:2:0; its
+    // chroma planes can then be as large as the luma plane.
+    const bool own_sampling = mode == 11 && (format & 0xFF) == EKO_FORMAT_YUV420;
+    const Bytes px = in.fill(own_sampling ? 3 * size_t(w) * h : image_bytes(format, w, h));
     const ImageInfo info{w, h, px.data(), 0, 0, 0, 0, 0, format, nullptr};
     Bytes out;
     bool ok;
