@@ -14,12 +14,6 @@ using namespace tekoj_test;
 
 namespace {
 
-Bytes noise(size_t n, uint32_t seed) {
-    Bytes b(n);
-    for (auto& v : b) v = static_cast<uint8_t>((seed = seed * 1664525u + 1013904223u) >> 24);
-    return b;
-}
-
 uint32_t append(void* arg, const uint8_t* data, uint32_t count) {
     static_cast<Bytes*>(arg)->insert(static_cast<Bytes*>(arg)->end(), data, data + count);
     return count;
