@@ -19,17 +19,6 @@ using namespace tekoj_test;
 
 namespace {
 
-// Checks when it goes that no block leaked and no file stayed open meanwhile.
-struct NoLeak {
-    FaultScope scope;
-    int64_t live = live_blocks();
-    size_t fds = open_descriptors();
-    ~NoLeak() {
-        EXPECT_EQ(live_blocks(), live);
-        EXPECT_EQ(open_descriptors(), fds);
-    }
-};
-
 const std::string kPath = temp_path("faults.jpg");
 
 }  // namespace

@@ -82,7 +82,7 @@ TEST(Packed422Reader, DefinedExamplesEdgesAndUnfitContexts) {
 // band, end mark. Odd heights put a single row in the last 4:2:0 pair; odd
 // widths leave the last column to the edge repetition.
 TEST(Packed422Encode, DecodesCloseToTheSource) {
-    const int64_t live = live_blocks();
+    NoLeak no_leak;
     const int cases[][3] = {{96, 64, 0}, {70, 45, 0}, {2, 1, 0}, {71, 33, 1}, {64, 24, 1}, {3, 5, 1}};
     for (const auto& [w, h, keep422] : cases) {
         Bytes packed, luma;  // smooth ramps, and the luma expected back
@@ -105,7 +105,6 @@ TEST(Packed422Encode, DecodesCloseToTheSource) {
         ASSERT_TRUE(d.ok && !d.warning && d.width == w && d.height == h) << w << "x" << h << ": " << d.message;
         EXPECT_GT(psnr(luma.data(), d.pixels.data(), luma.size()), 40.0) << w << "x" << h;
     }
-    EXPECT_EQ(live_blocks(), live);
 }
 
 }  // namespace

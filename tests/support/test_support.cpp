@@ -148,44 +148,31 @@ size_t image_size(uint32_t format, int width, int height) {
 
 static uint8_t clamp255(int v) { return static_cast<uint8_t>(v < 0 ? 0 : v > 255 ? 255 : v); }
 
-Bytes rgb_to_yuv420(const Bytes& rgb, int width, int height) {
-    const int cw = (width + 1) / 2, ch = (height + 1) / 2;
-    Bytes out(image_size(EKO_FORMAT_YUV420, width, height));
-    uint8_t* y = out.data();
-    uint8_t* u = y + static_cast<size_t>(width) * height;
-    uint8_t* v = u + static_cast<size_t>(cw) * ch;
-    for (int j = 0; j < height; ++j)
-        for (int i = 0; i < width; ++i) {
-            const uint8_t* p = &rgb[(static_cast<size_t>(j) * width + i) * 3];
-            y[static_cast<size_t>(j) * width + i] = clamp255(static_cast<int>(std::lround(0.299 * p[0] + 0.587 * p[1] + 0.114 * p[2])));
-        }
-    for (int j = 0; j < ch; ++j)
-        for (int i = 0; i < cw; ++i) {
-            double r = 0, g = 0, b = 0;
-            int n = 0;
-            for (int dy = 0; dy < 2; ++dy)
-                for (int dx = 0; dx < 2; ++dx) {
-                    int xx = 2 * i + dx, yy = 2 * j + dy;
-                    if (xx >= width || yy >= height) continue;
-                    const uint8_t* p = &rgb[(static_cast<size_t>(yy) * width + xx) * 3];
-                    r += p[0];
-                    g += p[1];
-                    b += p[2];
-                    ++n;
-                }
-            r /= n;
-            g /= n;
-            b /= n;
-            u[static_cast<size_t>(j) * cw + i] = clamp255(static_cast<int>(std::lround(128 - 0.168736 * r - 0.331264 * g + 0.5 * b)));
-            v[static_cast<size_t>(j) * cw + i] = clamp255(static_cast<int>(std::lround(128 + 0.5 * r - 0.418688 * g - 0.081312 * b)));
-        }
-    return out;
-}
-
 Bytes rgb_to_grey(const Bytes& rgb, int width, int height) {
     Bytes out(static_cast<size_t>(width) * height);
     for (size_t i = 0; i < out.size(); ++i)
         out[i] = clamp255(static_cast<int>(std::lround(0.299 * rgb[3 * i] + 0.587 * rgb[3 * i + 1] + 0.114 * rgb[3 * i + 2])));
+    return out;
+}
+
+// Chroma of each 2x2 block's mean colour (what of the block lies inside).
+Bytes rgb_to_yuv420(const Bytes& rgb, int width, int height) {
+    const int cw = (width + 1) / 2, ch = (height + 1) / 2;
+    Bytes out = rgb_to_grey(rgb, width, height);
+    out.resize(image_size(EKO_FORMAT_YUV420, width, height));
+    uint8_t* u = out.data() + static_cast<size_t>(width) * height;
+    uint8_t* v = u + static_cast<size_t>(cw) * ch;
+    for (int j = 0; j < ch; ++j)
+        for (int i = 0; i < cw; ++i) {
+            double sum[3] = {};
+            int n = 0;
+            for (int y = 2 * j; y < std::min(2 * j + 2, height); ++y)
+                for (int x = 2 * i; x < std::min(2 * i + 2, width); ++x, ++n)
+                    for (int k = 0; k < 3; ++k) sum[k] += rgb[(static_cast<size_t>(y) * width + x) * 3 + k];
+            const double r = sum[0] / n, g = sum[1] / n, b = sum[2] / n;
+            u[static_cast<size_t>(j) * cw + i] = clamp255(static_cast<int>(std::lround(128 - 0.168736 * r - 0.331264 * g + 0.5 * b)));
+            v[static_cast<size_t>(j) * cw + i] = clamp255(static_cast<int>(std::lround(128 + 0.5 * r - 0.418688 * g - 0.081312 * b)));
+        }
     return out;
 }
 
@@ -321,6 +308,11 @@ size_t find_marker(const Bytes& j, uint8_t code) {
 size_t open_descriptors() {
     using std::filesystem::directory_iterator;
     return size_t(std::distance(directory_iterator("/proc/self/fd"), directory_iterator{}));
+}
+
+NoLeak::~NoLeak() {
+    EXPECT_EQ(live_blocks(), live);
+    EXPECT_EQ(open_descriptors(), fds);
 }
 
 std::string member_name(int m) {

@@ -4,6 +4,8 @@
 
 #include <TekoJEncoderInternal.h>
 
+#include "support/fault_os_layer.h"
+
 #include <cstdint>
 #include <string>
 #include <vector>
@@ -80,6 +82,15 @@ std::vector<Bytes> header_segments(const Bytes& jpeg);
 Bytes segment(const Bytes& jpeg, uint8_t code);
 size_t find_marker(const Bytes& jpeg, uint8_t code);
 size_t open_descriptors();
+
+// Checks when it goes that no block leaked and no file stayed open since it
+// was made; failure injection is off again.
+struct NoLeak {
+    FaultScope scope;
+    int64_t live = live_blocks();
+    size_t fds = open_descriptors();
+    ~NoLeak();
+};
 
 // The ten whole-image members, by output kind.
 enum Member {
