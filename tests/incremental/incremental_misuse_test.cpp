@@ -121,7 +121,11 @@ TEST(ColumnSplit, RefusedWhereTheJoinCouldNotBeValid) {
     auto lists = block_lists(zero, 6, 0, 2, 1);
     EncoderContext* ctx = eko_jpeg_enc_mcu_init(&info, &memory, &options, &s);
     ASSERT_TRUE(ctx != nullptr && __eko_jpeg_enc_col_encoder_init(ctx) == 1);
-    for (int k = 0; k < 3; ++k) EXPECT_EQ(__eko_jpeg_enc_col_entroy_encoder(ctx, lists.data(), &next), k < 2 ? 1u : 0u);
+    // A join before the last column is refused too.
+    for (int k = 0; k < 3; ++k) {
+        EXPECT_EQ(__eko_jpeg_enc_col_entroy_encoder(ctx, lists.data(), &next), k < 2 ? 1u : 0u);
+        EXPECT_TRUE(k > 0 || (__eko_jpeg_enc_col_encoder_finish(ctx) == 0 && eko_GetLastError() == EKO_ERR_STATE));
+    }
     EXPECT_TRUE(next == 32 && eko_GetLastError() == EKO_ERR_STATE);
     uint8_t* block = yuv.data();
     uint32_t length = 7;

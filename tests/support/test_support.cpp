@@ -337,6 +337,7 @@ Call call_member(int m, const ImageInfo& info, uint32_t quality, const std::stri
         auto* to = static_cast<Call*>(arg);
         to->out.insert(to->out.end(), data, data + n);
         to->largest_piece = std::max(to->largest_piece, n);
+        to->pieces.emplace_back(data, Bytes(data, data + n));
         return 0;
     };
     if (fail_at >= 0) fail_allocation(fail_at);

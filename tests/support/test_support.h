@@ -8,6 +8,7 @@
 
 #include <cstdint>
 #include <string>
+#include <utility>
 #include <vector>
 
 namespace tekoj_test {
@@ -106,6 +107,7 @@ struct Call {
     uint32_t result = 0;
     Bytes out;                  // the stream: file contents, block or callback pieces in order
     uint32_t largest_piece = 0; // callback members
+    std::vector<std::pair<const uint8_t*, Bytes>> pieces;  // callback members: where each piece was, and its bytes
     bool kept = true;           // memory members: the caller's block and length are as they were
 };
 // One call of member `m` as a caller following the header makes it: file
