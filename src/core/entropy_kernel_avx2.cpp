@@ -47,8 +47,7 @@ void code_block_avx2(BitState& bits, int32_t dc_diff, const int16_t* block, cons
         zeros |= static_cast<uint64_t>(static_cast<uint32_t>(_mm_movemask_epi8(z))) << (16 * c);
     }
     const uint64_t mask = ~zeros & 0x7FFFFFFFFFFFFFFEull;
-    code_block_from_mask(bits, dc_diff, dc, ac, mask,
-                         [block](int p) { return clamp_ac(block[kZigzagToNatural[p]]); });
+    code_block_from_map<false>(bits, dc_diff, dc, ac, ScanMap{{mask}}, block, kScanOffsets.natural);
 }
 
 }  // namespace tekoj

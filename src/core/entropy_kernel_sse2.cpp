@@ -25,7 +25,7 @@ void code_block_sse2(BitState& bits, int32_t dc_diff, const int16_t* block, cons
         zeros |= static_cast<uint64_t>(static_cast<uint32_t>(_mm_movemask_epi8(z))) << (8 * r);
     }
     const uint64_t mask = ~zeros & 0x7FFFFFFFFFFFFFFEull;
-    code_block_from_mask(bits, dc_diff, dc, ac, mask, [&zz](int p) { return static_cast<int32_t>(zz[p]); });
+    code_block_from_map<false>(bits, dc_diff, dc, ac, ScanMap{{mask}}, zz, kScanOffsets.zigzag);
 }
 
 }  // namespace tekoj
