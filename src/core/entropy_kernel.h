@@ -13,10 +13,10 @@
 
 namespace tekoj {
 
-// Per-target block kernels; each exists only in builds for its processor.
-void code_block_sse2(BitState& bits, int32_t dc_diff, const int16_t* block, const uint32_t* dc, const uint32_t* ac);
-void code_block_avx2(BitState& bits, int32_t dc_diff, const int16_t* block, const uint32_t* dc, const uint32_t* ac);
-void code_block_neon(BitState& bits, int32_t dc_diff, const int16_t* block, const uint32_t* dc, const uint32_t* ac);
+// Per-target kernels; each exists only in builds for its processor.
+CoderKernels coder_kernels_sse2();
+CoderKernels coder_kernels_avx2();
+CoderKernels coder_kernels_neon();
 
 namespace {
 
@@ -236,6 +236,31 @@ template <bool kBiased>
     put(w, ac[0] >> 5, static_cast<int>(ac[0] & 31));  // EOB
     state = w;
 }
+
+// The kernels of one target from its inline block coder: one block out of
+// line, and the blocks of an MCU in one loop, so that the accumulator stays
+// in registers from block to block.
+template <void (*kCodeBlock)(BitState&, int32_t, const int16_t*, const uint32_t*, const uint32_t*)>
+struct KernelsOf {
+    static void block(BitState& bits, int32_t dc_diff, const int16_t* blk, const uint32_t* dc, const uint32_t* ac) {
+        kCodeBlock(bits, dc_diff, blk, dc, ac);
+    }
+    static void mcu(BitState& bits, const CoderTables& t, int16_t* const* blocks, int32_t* last_dc) {
+        BitState w = bits;
+        for (uint32_t n = 0; n < t.blocks_in_mcu; ++n) {
+            const uint32_t c = t.block_comp[n];
+            int16_t* blk = blocks[n];
+            int32_t diff = blk[0] - last_dc[c];
+            // The pixel path never exceeds category 11; a caller's blocks might.
+            diff = diff > 2047 ? 2047 : (diff < -2047 ? -2047 : diff);
+            kCodeBlock(w, diff, blk, t.dc[t.block_dc[n]], t.ac[t.block_ac[n]]);
+            blk[kZigzagToNatural[63]] = 0;
+            last_dc[c] = blk[0];
+        }
+        bits = w;
+    }
+    static constexpr CoderKernels kernels{block, mcu};
+};
 
 }  // namespace
 }  // namespace tekoj

@@ -49,7 +49,10 @@ inline uint8x16_t zero_bytes(const int16_t* row) {
 
 }  // namespace
 
-void code_block_neon(BitState& bits, int32_t dc_diff, const int16_t* block, const uint32_t* dc, const uint32_t* ac) {
+namespace {
+
+[[gnu::always_inline]] inline void code_block(BitState& bits, int32_t dc_diff, const int16_t* block, const uint32_t* dc,
+                                              const uint32_t* ac) {
     // 0xFF for each zero coefficient, natural order, two rows per vector.
     const uint8x16_t f01 = zero_bytes(block), f23 = zero_bytes(block + 16);
     const uint8x16_t f45 = zero_bytes(block + 32), f67 = zero_bytes(block + 48);
@@ -86,6 +89,10 @@ void code_block_neon(BitState& bits, int32_t dc_diff, const int16_t* block, cons
     }
     code_block_from_map<false>(bits, dc_diff, dc, ac, map, block, kScanOffsets.natural);
 }
+
+}  // namespace
+
+CoderKernels coder_kernels_neon() { return KernelsOf<code_block>::kernels; }
 
 }  // namespace tekoj
 #endif
