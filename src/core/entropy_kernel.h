@@ -62,7 +62,7 @@ inline void write_byte(uint8_t*& out, uint32_t b) {
 // most 26.
 [[gnu::always_inline]] inline void put(BitState& w, uint32_t code, int size) {
     w.free -= size;
-    if (w.free >= 0) [[likely]] {
+    if (__builtin_expect(w.free >= 0, 1)) {
         w.acc = (w.acc << size) | code;
     } else {
         // Fill the word, write it, keep the rest of the code.
@@ -150,6 +150,10 @@ inline ScanMap scan_map_from_bits(uint64_t bits) {
     return (m >> r) >> 1;
 }
 
+// A biased value beyond +-1023 as +-1023 (category 10) is biased; out of
+// line, so that the coding loop keeps the sign only where it needs it.
+[[gnu::noinline]] inline uint32_t limited(uint32_t t) { return 0x3FFu ^ static_cast<uint32_t>(static_cast<int32_t>(t) >> 31); }
+
 // Byte offsets of the coefficient at each zig-zag position in a block in
 // natural order, and in one already in zig-zag order.
 struct ScanOffsets {
@@ -196,12 +200,10 @@ template <bool kBiased>
         // t: the value, less one when negative (its low bits are the extra
         // bits); t ^ sign is the magnitude.
         const int32_t ts = kBiased ? v : v + (v >> 31);
-        const uint32_t s = static_cast<uint32_t>(ts >> 31);
         uint32_t t = static_cast<uint32_t>(ts);
-        int z = __builtin_clz(t ^ s);  // 32 - category; the value is not 0
-        if (z < 22) [[unlikely]] {
-            // Beyond +-1023: coded as +-1023 (category 10).
-            t = 0x3FFu ^ s;
+        int z = __builtin_clz(t ^ static_cast<uint32_t>(ts >> 31));  // 32 - category; the value is not 0
+        if (__builtin_expect(z < 22, 0)) {
+            t = limited(t);
             z = 22;
         }
         const uint32_t entry = ac_top[(run << 4) - z];
