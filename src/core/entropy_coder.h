@@ -76,6 +76,7 @@ struct EkoCoderTables {
     uint32_t ac[2][256];
     tekoj::BlockKernel kernel;   // one block
     tekoj::McuKernel mcu_kernel;  // all blocks of an MCU, when room for all is certain
+    uint32_t mcu_room;  // free bytes that let an MCU through without room checks
     uint8_t blocks_in_mcu;
     uint8_t comps_in_scan;
     uint8_t block_comp[10];  // scan component of each block of the MCU
