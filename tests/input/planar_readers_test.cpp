@@ -93,14 +93,15 @@ TEST(RgbReaders, CellsBeyondTheWrittenOnesRepeatTheLastColumnAndRow) {
     const std::pair<uint32_t, uint32_t (*)(EncoderContext*)> readers[] = {
         {EKO_FORMAT_RGB565, __eko_jpeg_enc_get_raw_rgb565_data}, {EKO_FORMAT_RGB888, __eko_jpeg_enc_get_raw_rgb888_data},
         {EKO_FORMAT_RGBA8888, __eko_jpeg_enc_get_raw_rgba8888_data}, {EKO_FORMAT_BGRA8888, __eko_jpeg_enc_get_raw_bgra8888_data}};
-    for (const auto& [f, read] : readers)
+    for (const auto& reader : readers)
         for (int w : {1, 2, 5, 17, 32})
             for (int h : {1, 3, 16, 17, 30}) {
+                const uint32_t f = reader.first;
                 SCOPED_TRACE("format " + std::to_string(f) + " " + std::to_string(w) + "x" + std::to_string(h));
                 const Bytes image = rgb_to_format(photo_rgb(w, h, 3), w, h, f);
                 // RGB565 converts column pairs (a width of 1 pairs with
                 // itself) and doubles an odd last row.
-                expect_edges_repeated(image_info(image.data(), w, h, f), read, [&](EncoderContext* ctx, int c) {
+                expect_edges_repeated(image_info(image.data(), w, h, f), reader.second, [&](EncoderContext* ctx, int c) {
                     const uint32_t n = ctx->comp_info[0].rows_this_band, pairs = (n + 1) / 2;
                     const bool averaging = f == EKO_FORMAT_RGB565;
                     const uint32_t y_cols = averaging ? (w == 1 ? 2 : w & ~1) : w, y_rows = averaging ? 2 * pairs : n;
