@@ -82,16 +82,13 @@ inline void butterfly_rest(const int16x8_t (&tmp)[8], int16x4_t k, int16x8_t (&d
     d[7] = vsubq_s16(z11, z4);
 }
 
-// Divisor words below 32768: (x * m + (x < 0 ? 32768 : 0)) >> 16 with m in a
-// signed 16-bit lane; the bias is the sign mask (-1 or 0) times -32768.
-inline int16x8_t quantise8_narrow(int16x8_t x, const int16_t* m, int16x4_t c) {
-    const int16x8_t mul = vld1q_s16(m);
-    const int16x8_t sign = vshrq_n_s16(x, 15);
-    int32x4_t lo = vmull_s16(vget_low_s16(x), vget_low_s16(mul));
-    int32x4_t hi = vmull_s16(vget_high_s16(x), vget_high_s16(mul));
-    lo = vmlal_lane_s16(lo, vget_low_s16(sign), c, 0);
-    hi = vmlal_lane_s16(hi, vget_high_s16(sign), c, 0);
-    return vcombine_s16(vshrn_n_s32(lo, 16), vshrn_n_s32(hi, 16));
+// Divisor words below 32768, on 16-bit lanes: with A = vqdmulh(x, m) =
+// floor(x m / 32768) (no saturation, as m > 0), nested floors give
+//   x >= 0: floor(x m / 65536) = A >> 1,
+//   x <  0: floor((x m + 32768) / 65536) = (A + 1) >> 1,
+// that is (A - sign) >> 1 with the sign mask (-1 or 0): one halving subtract.
+inline int16x8_t quantise8_narrow(int16x8_t x, const int16_t* m) {
+    return vhsubq_s16(vqdmulhq_s16(x, vld1q_s16(m)), vshrq_n_s16(x, 15));
 }
 
 // Any divisor word up to 65536: the multiply in 32-bit lanes.
@@ -103,7 +100,7 @@ inline int16x4_t quantise4_wide(int16x4_t x, const uint32_t* m, int16x4_t c) {
 
 template <bool Narrow>
 inline int16x8_t quantise_row(int16x8_t x, const QuantTable& quant, int v, int16x4_t c) {
-    if constexpr (Narrow) return quantise8_narrow(x, quant.mul + 8 * v, c);
+    if constexpr (Narrow) return quantise8_narrow(x, quant.mul + 8 * v);
     const uint32_t* m = quant.divisors + 8 * v;
     return vcombine_s16(quantise4_wide(vget_low_s16(x), m, c), quantise4_wide(vget_high_s16(x), m + 4, c));
 }
