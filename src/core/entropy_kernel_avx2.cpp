@@ -30,7 +30,10 @@ constexpr FlagShuffles kFlagShuffles = make_flag_shuffles();
 
 }  // namespace
 
-void code_block_avx2(BitState& bits, int32_t dc_diff, const int16_t* block, const uint32_t* dc, const uint32_t* ac) {
+namespace {
+
+[[gnu::always_inline]] inline void code_block(BitState& bits, int32_t dc_diff, const int16_t* block, const uint32_t* dc,
+                                              const uint32_t* ac) {
     const __m128i zero = _mm_setzero_si128();
     __m128i flags[4];  // 0xFF for each zero coefficient, natural order
     for (int s = 0; s < 4; ++s) {
@@ -47,9 +50,12 @@ void code_block_avx2(BitState& bits, int32_t dc_diff, const int16_t* block, cons
         zeros |= static_cast<uint64_t>(static_cast<uint32_t>(_mm_movemask_epi8(z))) << (16 * c);
     }
     const uint64_t mask = ~zeros & 0x7FFFFFFFFFFFFFFEull;
-    code_block_from_mask(bits, dc_diff, dc, ac, mask,
-                         [block](int p) { return clamp_ac(block[kZigzagToNatural[p]]); });
+    code_block_from_map<false>(bits, dc_diff, dc, ac, ScanMap{{mask}}, block, kScanOffsets.natural);
 }
+
+}  // namespace
+
+CoderKernels coder_kernels_avx2() { return KernelsOf<code_block>::kernels; }
 
 }  // namespace tekoj
 #endif
