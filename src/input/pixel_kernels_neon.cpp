@@ -1,10 +1,12 @@
 // NEON row kernels of the input readers. The structure loads (vld3, vld4)
 // split the channels; seen as 16-bit lanes, each channel vector holds the
 // even pixels in its low bytes and the odd ones in its high bytes, which is
-// exactly the split that chroma from even pixels needs. Sums are formed in
-// 32-bit lanes by widening multiply-accumulate, the same integers as the
-// portable code; the chroma bias keeps them non-negative, so unsigned
-// wrap-around in the intermediate steps cancels out.
+// exactly the split that chroma from even pixels needs. The byte layouts
+// convert on 8-bit lanes (see below); RGB565, whose channels arrive as
+// 16-bit values, forms its sums in 32-bit lanes by widening
+// multiply-accumulate, the same integers as the portable code; the chroma
+// bias keeps them non-negative, so unsigned wrap-around in the intermediate
+// steps cancels out.
 #include "input/pixel_kernels.h"
 
 #if defined(__ARM_NEON) || defined(__ARM_NEON__)
@@ -69,48 +71,98 @@ inline uint8x8_t cr8(const Channels& c, const Weights& w) {
                                   cr4(vget_high_u16(c.r), vget_high_u16(c.g), vget_high_u16(c.b), w)));
 }
 
-// Sixteen pixels' channels, even pixels and odd pixels apart.
-struct EvenOdd {
-    Channels even, odd;
+// The byte layouts convert on 8-bit lanes with widening byte multiplies.
+// Each weight splits as w = 64 hi + lo with 0 <= lo < 64 (hi negative for
+// the negative chroma weights), so that both partial sums of three byte
+// products fit 16 bits: the fixed-point sum is S = 64 H + L with L >= 0, and
+// the result floor(S / 4096) = (H + (L >> 6)) >> 6. The chroma bias 128 << 12
+// goes into H as 8192. H alone may wrap modulo 2^16 (negative chroma
+// weights), but H + (L >> 6) = floor(S / 64) lies in 0..16383, so the sum
+// taken modulo 2^16 and then shifted is exact.
+//   Y:  1225 = 64 * 19 + 9,   2404 = 64 * 37 + 36,  467 = 64 * 7 + 19
+//   Cb: 2048 = 64 * 32,       -691 = 64 * -11 + 13, -1357 = 64 * -22 + 51
+//   Cr: 2048 = 64 * 32,      -1715 = 64 * -27 + 13,  -333 = 64 * -6 + 51
+static_assert(19 * 64 + 9 == rgb::kYr && 37 * 64 + 36 == rgb::kYg && 7 * 64 + 19 == rgb::kYb);
+static_assert(-11 * 64 + 13 == rgb::kCbR && -22 * 64 + 51 == rgb::kCbG && 32 * 64 == rgb::kCbB);
+static_assert(32 * 64 == rgb::kCrR && -27 * 64 + 13 == rgb::kCrG && -6 * 64 + 51 == rgb::kCrB);
+static_assert(rgb::kChromaBias == 8192 * 64);
+
+struct Bytes3 {
+    uint8x8_t r, g, b;
+};
+
+inline uint8x8_t finish(uint16x8_t h, uint16x8_t l) { return vshrn_n_u16(vsraq_n_u16(h, l, 6), 6); }
+
+inline uint8x8_t luma_bytes(const Bytes3& c) {
+    uint16x8_t h = vmull_u8(c.r, vdup_n_u8(19));
+    h = vmlal_u8(h, c.g, vdup_n_u8(37));
+    h = vmlal_u8(h, c.b, vdup_n_u8(7));
+    uint16x8_t l = vmull_u8(c.r, vdup_n_u8(9));
+    l = vmlal_u8(l, c.g, vdup_n_u8(36));
+    l = vmlal_u8(l, c.b, vdup_n_u8(19));
+    return finish(h, l);
+}
+
+inline uint8x8_t cb_bytes(const Bytes3& c) {
+    uint16x8_t h = vmlal_u8(vdupq_n_u16(8192), c.b, vdup_n_u8(32));
+    h = vmlsl_u8(h, c.r, vdup_n_u8(11));
+    h = vmlsl_u8(h, c.g, vdup_n_u8(22));
+    const uint16x8_t l = vmlal_u8(vmull_u8(c.r, vdup_n_u8(13)), c.g, vdup_n_u8(51));
+    return finish(h, l);
+}
+
+inline uint8x8_t cr_bytes(const Bytes3& c) {
+    uint16x8_t h = vmlal_u8(vdupq_n_u16(8192), c.r, vdup_n_u8(32));
+    h = vmlsl_u8(h, c.g, vdup_n_u8(27));
+    h = vmlsl_u8(h, c.b, vdup_n_u8(6));
+    const uint16x8_t l = vmlal_u8(vmull_u8(c.g, vdup_n_u8(13)), c.b, vdup_n_u8(51));
+    return finish(h, l);
+}
+
+// Sixteen pixels' channels.
+struct Pixels16 {
+    uint8x16_t r, g, b;
 };
 
 template <int Bpp, bool Bgr>
-inline EvenOdd load16(const uint8_t* p) {
-    uint8x16_t r, g, b;
+inline Pixels16 load16(const uint8_t* p) {
     if constexpr (Bpp == 3) {
         const uint8x16x3_t v = vld3q_u8(p);
-        r = v.val[0], g = v.val[1], b = v.val[2];
+        return {v.val[0], v.val[1], v.val[2]};
     } else {
         const uint8x16x4_t v = vld4q_u8(p);
-        r = v.val[Bgr ? 2 : 0], g = v.val[1], b = v.val[Bgr ? 0 : 2];
+        return {v.val[Bgr ? 2 : 0], v.val[1], v.val[Bgr ? 0 : 2]};
     }
-    const uint16x8_t low = vdupq_n_u16(0x00FF);
-    const uint16x8_t r16 = vreinterpretq_u16_u8(r), g16 = vreinterpretq_u16_u8(g), b16 = vreinterpretq_u16_u8(b);
-    return {{vandq_u16(r16, low), vandq_u16(g16, low), vandq_u16(b16, low)},
-            {vshrq_n_u16(r16, 8), vshrq_n_u16(g16, 8), vshrq_n_u16(b16, 8)}};
+}
+
+inline uint8x16_t luma16(const Pixels16& p) {
+    return vcombine_u8(luma_bytes({vget_low_u8(p.r), vget_low_u8(p.g), vget_low_u8(p.b)}),
+                       luma_bytes({vget_high_u8(p.r), vget_high_u8(p.g), vget_high_u8(p.b)}));
+}
+
+// The even pixels' channels: seen as 16-bit lanes, the low byte of each.
+inline Bytes3 even8(const Pixels16& p) {
+    return {vmovn_u16(vreinterpretq_u16_u8(p.r)), vmovn_u16(vreinterpretq_u16_u8(p.g)),
+            vmovn_u16(vreinterpretq_u16_u8(p.b))};
 }
 
 template <int Bpp, bool Bgr, PickLayout Layout>
 void pick_upper(const uint8_t* src, uint32_t w, uint8_t* y, uint8_t* cb, uint8_t* cr) {
-    const Weights wt = weights();
     uint32_t x = 0;
     for (; x + 16 <= w; x += 16) {
-        const EvenOdd px = load16<Bpp, Bgr>(src + static_cast<size_t>(x) * Bpp);
-        vst1_u8(cb + x / 2, cb8(px.even, wt));
-        vst1_u8(cr + x / 2, cr8(px.even, wt));
-        vst2_u8(y + x, (uint8x8x2_t{{luma8(px.even, wt), luma8(px.odd, wt)}}));
+        const Pixels16 px = load16<Bpp, Bgr>(src + static_cast<size_t>(x) * Bpp);
+        vst1q_u8(y + x, luma16(px));
+        const Bytes3 even = even8(px);
+        vst1_u8(cb + x / 2, cb_bytes(even));
+        vst1_u8(cr + x / 2, cr_bytes(even));
     }
     kPortableInputKernels.pick_upper[Layout](src + static_cast<size_t>(x) * Bpp, w - x, y + x, cb + x / 2, cr + x / 2);
 }
 
 template <int Bpp, bool Bgr, PickLayout Layout>
 void pick_lower(const uint8_t* src, uint32_t w, uint8_t* y) {
-    const Weights wt = weights();
     uint32_t x = 0;
-    for (; x + 16 <= w; x += 16) {
-        const EvenOdd px = load16<Bpp, Bgr>(src + static_cast<size_t>(x) * Bpp);
-        vst2_u8(y + x, (uint8x8x2_t{{luma8(px.even, wt), luma8(px.odd, wt)}}));
-    }
+    for (; x + 16 <= w; x += 16) vst1q_u8(y + x, luma16(load16<Bpp, Bgr>(src + static_cast<size_t>(x) * Bpp)));
     kPortableInputKernels.pick_lower[Layout](src + static_cast<size_t>(x) * Bpp, w - x, y + x);
 }
 
