@@ -5,7 +5,6 @@
 // written and never writing past their capacity.
 #include <TekoJEncoderInternal.h>
 
-#include "support/fault_os_layer.h"
 #include "support/test_support.h"
 
 #include <gtest/gtest.h>

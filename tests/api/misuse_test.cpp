@@ -3,7 +3,6 @@
 // reports its code (kept per thread), leaks no block and leaves no file open.
 #include <TekoJEncoderInternal.h>
 
-#include "support/fault_os_layer.h"
 #include "support/test_support.h"
 
 #include <gtest/gtest.h>
@@ -45,8 +44,6 @@ void expect_refused_by_every_member(const ImageInfo& info, uint32_t error) {
         std::remove(name.c_str());
     }
 }
-
-EncoderSettings settings_420() { return settings(0, 1, 2, 2, 50); }
 
 uint8_t g_mark;
 
@@ -161,7 +158,7 @@ TEST(Creation, RefusesSettingsThatTheGeometryCannotServe) {
     for (const auto& row : rows) {
         SCOPED_TRACE(row.what);
         const ImageInfo info = image_info(px.data(), 48, 40, row.format);
-        EncoderSettings s = settings_420();
+        EncoderSettings s = settings(0, 1, 2, 2, 50);
         // The unchanged record is accepted.
         if (row.format != EKO_FORMAT_GREY) { EXPECT_TRUE(decode_jpeg(encode_in_steps(info, &s)).ok); }
         row.change(s);
@@ -174,7 +171,7 @@ TEST(Creation, SettingsForOneComponentOrWithoutDriAreFollowed) {
     // codes its Y plane alone, exactly as grey.
     const Bytes rgb = photo_rgb(37, 48, 4);
     const Bytes grey = rgb_to_grey(rgb, 37, 48), yuv = rgb_to_yuv420(rgb, 37, 48);
-    EncoderSettings s = settings_420();
+    EncoderSettings s = settings(0, 1, 2, 2, 50);
     s.num_components = 1;
     const Bytes reference = encode_in_steps(image_info(grey.data(), 37, 48, EKO_FORMAT_GREY), &s);
     EXPECT_TRUE(decode_jpeg(reference).ok && !decode_jpeg(reference).warning);
@@ -191,7 +188,7 @@ TEST(Creation, SettingsForOneComponentOrWithoutDriAreFollowed) {
         }
     }
     // Four tables, the chroma components naming tables 2 and 3.
-    s = settings_420();
+    s = settings(0, 1, 2, 2, 50);
     s.num_quant_tables = 4, s.component_specs[1][0] = 2, s.component_specs[2][0] = 3;
     std::memcpy(s.quant_tables[2], eko_chrominanceQuantTbl[3], 64);
     std::memcpy(s.quant_tables[3], eko_chrominanceQuantTbl[6], 64);
@@ -199,7 +196,7 @@ TEST(Creation, SettingsForOneComponentOrWithoutDriAreFollowed) {
     EXPECT_TRUE(decode_jpeg(four).ok && !decode_jpeg(four).warning && find_marker(four, 0xDB) < four.size());
     // write_dri 0: neither a DRI segment nor restart markers.
     const ImageInfo colour = image_info(yuv.data(), 37, 48, EKO_FORMAT_YUV420);
-    s = settings_420();
+    s = settings(0, 1, 2, 2, 50);
     s.write_dri = 0;
     const Bytes jpeg = encode_in_steps(colour, &s);
     for (uint8_t code : {0xDD, 0xD0, 0xD1, 0xD2, 0xD7}) EXPECT_EQ(find_marker(jpeg, code), jpeg.size()) << int(code);
@@ -230,7 +227,7 @@ TEST(ErrorCode, EveryCallThatSucceedsReportsNoError) {
     for (int m = 0; m < kMembers; ++m) fresh(member_name(m), call_member(m, info, 75, path).result == 1);
     std::remove(path.c_str());
     // Incremental: a band, a row of coefficients, columns and the join.
-    const EncoderSettings s = settings_420();
+    const EncoderSettings s = settings(0, 1, 2, 2, 50);
     const EncodeOptions options{75, nullptr, 0};
     std::vector<int16_t> zero(12 * 64, 0);
     McuBlockList mcus[2];

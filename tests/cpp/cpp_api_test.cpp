@@ -113,10 +113,9 @@ TEST(CppApi, SemiPlanarAndPacked422MatchTheirPlanarEquivalent) {
             SCOPED_TRACE(testing::Message() << w << "x" << h);
             const Planes p = yuv420_planes(w, h, uint32_t(w * h));
             const size_t cw = (w + 1) / 2;
-            Bytes i420 = p.y;
-            i420.insert(i420.end(), p.u.begin(), p.u.end());
-            i420.insert(i420.end(), p.v.begin(), p.v.end());
-            const Bytes expected = c_api_stream(i420.data(), w, h, EKO_FORMAT_YUV420, 70);
+            const Bytes expected =
+                c_api_stream(tekoj_test::rgb_to_yuv420(tekoj_test::photo_rgb(w, h, uint32_t(w * h)), w, h).data(), w, h,
+                             EKO_FORMAT_YUV420, 70);
             tekoj::Encoder enc;
             enc.quality(70);
 
