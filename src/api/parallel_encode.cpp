@@ -251,8 +251,9 @@ bool code_row(const Encode* e, EncoderContext* w, OutputTarget* out, uint32_t ro
 // eighth more: a few growths in all rather than one every half again, so
 // the join copies hardly a byte twice and the worker handing rows on is
 // rarely held up by a long copy while the others wait for the window. The
-// growth is at most fourfold, so an early dense row cannot claim a block
-// far beyond the stream.
+// growth is at least half again (flat rows first make a poor estimate) and
+// at most fourfold, so an early dense row cannot claim a block far beyond
+// the stream.
 bool hand_on_row(Encode* e, uint32_t row, const OutputTarget& coded) {
     EncoderContext* main = e->main;
     const Sink sink = sink_of(main);
@@ -263,7 +264,7 @@ bool hand_on_row(Encode* e, uint32_t row, const OutputTarget& coded) {
         const uint64_t later = e->rows - row - 1;
         const uint64_t ahead = later * mean + (later * mean + 64) / 8;
         const uint64_t now = static_cast<uint64_t>(t->used) + coded.used;
-        const uint64_t room = coded.used + std::min(ahead, 3 * now);
+        const uint64_t room = coded.used + std::clamp(ahead, now / 2, 3 * now);
         if (!kind.reserve(sink, std::min<uint64_t>(room, kMaxMemoryStream - t->used))) return false;
     }
     e->row_bytes += coded.used;
