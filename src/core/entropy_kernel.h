@@ -181,6 +181,9 @@ template <bool kBiased>
 [[gnu::always_inline]] inline void code_block_from_map(BitState& state, int32_t dc_diff, const uint32_t* dc,
                                                       const uint32_t* ac, const ScanMap& map, const int16_t* values,
                                                       const uint8_t* offsets) {
+    // Word-sized signed counts throughout: no widening in the loop on 64-bit
+    // processors.
+    using Count = intptr_t;
     BitState w = state;
     {
         const int k = category(dc_diff);
@@ -190,7 +193,7 @@ template <bool kBiased>
     // the magnitude], the category being 32 less those zeros.
     const uint32_t* ac_top = ac + 32;
     const char* base = reinterpret_cast<const char*>(values);
-    auto code = [&](int run, const uint8_t* at) __attribute__((always_inline)) {
+    auto code = [&](Count run, const uint8_t* at) __attribute__((always_inline)) {
         while (run > 15) [[unlikely]] {
             put(w, ac[0xF0] >> 5, static_cast<int>(ac[0xF0] & 31));
             run -= 16;
@@ -201,17 +204,17 @@ template <bool kBiased>
         // bits); t ^ sign is the magnitude.
         const int32_t ts = kBiased ? v : v + (v >> 31);
         uint32_t t = static_cast<uint32_t>(ts);
-        int z = __builtin_clz(t ^ static_cast<uint32_t>(ts >> 31));  // 32 - category; the value is not 0
+        Count z = __builtin_clz(t ^ static_cast<uint32_t>(ts >> 31));  // 32 - category; the value is not 0
         if (__builtin_expect(z < 22, 0)) {
             t = limited(t);
             z = 22;
         }
-        const uint32_t entry = ac_top[(run << 4) - z];
+        const uint32_t entry = ac_top[run * 16 - z];
         put(w, (entry >> 5) | ((t << z) >> z), static_cast<int>(entry & 31));
     };
     // `carry`: zeros since the last coded position that belong to the next
     // run (the DC position counts as coded, hence -1 before position 0).
-    int carry = -1;
+    Count carry = -1;
 #pragma GCC unroll 2
     for (int h = 0; h < kScanWords; ++h) {
         ScanWord m = map.word[h];
@@ -220,20 +223,20 @@ template <bool kBiased>
             continue;
         }
         const uint8_t* at = offsets + h * kScanWordBits - 1;  // last position consumed
-        int r = first_set(m);
-        m = skip_past(m, r);
+        Count r = first_set(m);
+        m = skip_past(m, static_cast<int>(r));
         at += r + 1;
         code(r + carry, at);
         while (m != 0) {
             // The word was shifted by one at least, so r + 1 is below its
             // width and one shift does.
             r = first_set(m);
-            const int step = r + 1;
+            const Count step = r + 1;
             m = kScanFromTop ? m << step : m >> step;
             at += step;
             code(r, at);
         }
-        carry = static_cast<int>(offsets + (h + 1) * kScanWordBits - 1 - at);
+        carry = offsets + (h + 1) * kScanWordBits - 1 - at;
     }
     put(w, ac[0] >> 5, static_cast<int>(ac[0] & 31));  // EOB
     state = w;

@@ -40,11 +40,11 @@ alignas(8) constexpr uint8_t kBitWeights[8] = {
     kScanFromTop ? 128 : 1, kScanFromTop ? 64 : 2, kScanFromTop ? 32 : 4, kScanFromTop ? 16 : 8,
     kScanFromTop ? 8 : 16,  kScanFromTop ? 4 : 32, kScanFromTop ? 2 : 64, kScanFromTop ? 1 : 128};
 
-// 0xFF for each zero coefficient of two rows: the compare flags' even bytes.
+// 0xFF for each zero coefficient of two rows: a coefficient is zero when
+// both its bytes are, and a de-interleaving load brings them side by side.
 inline uint8x16_t zero_bytes(const int16_t* row) {
-    const uint16x8_t a = vceqq_s16(vld1q_s16(row), vdupq_n_s16(0));
-    const uint16x8_t b = vceqq_s16(vld1q_s16(row + 8), vdupq_n_s16(0));
-    return vuzpq_u8(vreinterpretq_u8_u16(a), vreinterpretq_u8_u16(b)).val[0];
+    const uint8x16x2_t b = vld2q_u8(reinterpret_cast<const uint8_t*>(row));
+    return vceqq_u8(vorrq_u8(b.val[0], b.val[1]), vdupq_n_u8(0));
 }
 
 }  // namespace
