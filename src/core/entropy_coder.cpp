@@ -116,8 +116,13 @@ bool build_coder_tables(EncoderContext* ctx) {
         for (uint32_t k = 0; k < 12; ++k) t->dc[n][k] = combined(dc->code[k], dc->size[k], k);
         for (uint32_t s = 0; s < 256; ++s) t->ac[n][s] = combined(ac->code[s], ac->size[s], s & 15);
     }
-    t->kernel = block_kernel_for(static_cast<int>(simd_level()));
+    const CoderKernels kernels = coder_kernels_for(static_cast<int>(simd_level()));
+    t->kernel = kernels.block;
+    t->mcu_kernel = kernels.mcu;
     t->blocks_in_mcu = ctx->blocks_in_mcu;
+    // A restart marker flushes at most a stuffed accumulator and writes three
+    // bytes more.
+    t->mcu_room = kBlockWorstCase * ctx->blocks_in_mcu + 2 * kPendingBytes + 4;
     t->comps_in_scan = ctx->comps_in_scan;
     for (uint32_t b = 0; b < ctx->blocks_in_mcu && b < 10; ++b) {
         const uint32_t c = ctx->mcu_membership[b];
@@ -174,8 +179,25 @@ bool finish_row(RowCoder& rc) {
 }
 
 bool code_mcu(RowCoder& rc, const CoderTables& t, int16_t* const* blocks) {
+    // Room for every block's worst case after a restart marker: then neither
+    // the make-room point below nor any block would make room, and the MCU
+    // goes through in one kernel call.
+    const OutputTarget* target = rc.sink.target;
+    if (target->capacity - static_cast<uint64_t>(rc.bits.out - target->buffer) >= t.mcu_room &&
+        *rc.sink.failed == 0) [[likely]] {
+        if (rc.restart.tick()) write_restart(rc, t.comps_in_scan);
+        t.mcu_kernel(rc.bits, t, blocks, rc.last_dc);
+        return true;
+    }
     if (!room_for_mcu(rc, 128u * t.blocks_in_mcu)) return false;
     if (!restart_step(rc, t.comps_in_scan)) return false;
+    // With room for every block's worst case, no block would make room: code
+    // them in one go.
+    if (target->capacity - static_cast<uint64_t>(rc.bits.out - target->buffer) >=
+        uint64_t{kBlockWorstCase} * t.blocks_in_mcu + kPendingBytes) {
+        t.mcu_kernel(rc.bits, t, blocks, rc.last_dc);
+        return true;
+    }
     for (uint32_t n = 0; n < t.blocks_in_mcu; ++n) {
         if (!room_for_block(rc)) return false;
         const uint32_t c = t.block_comp[n];

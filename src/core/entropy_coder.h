@@ -53,6 +53,18 @@ inline constexpr uint32_t kBlockWorstCase = 2 * ((22 + 62 * 26 + 16 + 7) / 8) + 
 
 }  // namespace tekoj
 
+struct EkoCoderTables;
+
+namespace tekoj {
+
+// Codes the blocks of one MCU as BlockKernel does each, with the DC
+// differences from and back into `last_dc` (per scan component) and the
+// last zig-zag position of each block cleared after coding. The caller has
+// made room for blocks_in_mcu * kBlockWorstCase bytes.
+using McuKernel = void (*)(BitState& bits, const ::EkoCoderTables& tables, int16_t* const* blocks, int32_t* last_dc);
+
+}  // namespace tekoj
+
 // Read-only coding tables of one encode. A code table entry holds, for one
 // symbol with k extra bits (k = the DC category, or the low four bits of an
 // AC symbol), the Huffman code shifted left by k in its upper bits and the
@@ -62,7 +74,9 @@ inline constexpr uint32_t kBlockWorstCase = 2 * ((22 + 62 * 26 + 16 + 7) / 8) + 
 struct EkoCoderTables {
     uint32_t dc[2][16];
     uint32_t ac[2][256];
-    tekoj::BlockKernel kernel;
+    tekoj::BlockKernel kernel;   // one block
+    tekoj::McuKernel mcu_kernel;  // all blocks of an MCU, when room for all is certain
+    uint32_t mcu_room;  // free bytes that let an MCU through without room checks
     uint8_t blocks_in_mcu;
     uint8_t comps_in_scan;
     uint8_t block_comp[10];  // scan component of each block of the MCU
@@ -148,8 +162,12 @@ void pad_final_byte(EncoderContext* ctx);
 // blocks and the coder state.
 bool mcu_codable(const EncoderContext* ctx, int16_t* const* blocks);
 
-// The block kernel of a SIMD level (the portable one where the level has
-// none or this build lacks it).
-BlockKernel block_kernel_for(int simd_level);
+// The coding kernels of a SIMD level (the portable ones where the level has
+// none or this build lacks them).
+struct CoderKernels {
+    BlockKernel block;
+    McuKernel mcu;
+};
+CoderKernels coder_kernels_for(int simd_level);
 
 }  // namespace tekoj

@@ -13,10 +13,10 @@
 
 namespace tekoj {
 
-// Per-target block kernels; each exists only in builds for its processor.
-void code_block_sse2(BitState& bits, int32_t dc_diff, const int16_t* block, const uint32_t* dc, const uint32_t* ac);
-void code_block_avx2(BitState& bits, int32_t dc_diff, const int16_t* block, const uint32_t* dc, const uint32_t* ac);
-void code_block_neon(BitState& bits, int32_t dc_diff, const int16_t* block, const uint32_t* dc, const uint32_t* ac);
+// Per-target kernels; each exists only in builds for its processor.
+CoderKernels coder_kernels_sse2();
+CoderKernels coder_kernels_avx2();
+CoderKernels coder_kernels_neon();
 
 namespace {
 
@@ -34,10 +34,17 @@ inline void write_byte(uint8_t*& out, uint32_t b) {
     if ((b & 0xFF) == 0xFF) *out++ = 0;
 }
 
+// Writes a full word byte by byte, stuffing after each 0xFF; out of line, so
+// that the rare case does not crowd the inlined coding loop.
+[[gnu::noinline]] inline uint8_t* write_word_stuffed(uint8_t* out, BitAcc v) {
+    for (int s = kAccBits - 8; s >= 0; s -= 8) write_byte(out, static_cast<uint32_t>(v >> s) & 0xFF);
+    return out;
+}
+
 // Writes the whole (full) accumulator, most significant byte first.
-inline void flush_word(BitState& w) {
+[[gnu::always_inline]] inline void flush_word(BitState& w) {
     const BitAcc v = w.acc;
-    if (!has_ff_byte(v)) {
+    if (!has_ff_byte(v)) [[likely]] {
         BitAcc be;
         if constexpr (sizeof(BitAcc) == 8) {
             be = __builtin_bswap64(v);
@@ -47,23 +54,22 @@ inline void flush_word(BitState& w) {
         std::memcpy(w.out, &be, sizeof be);
         w.out += sizeof be;
     } else {
-        for (int s = kAccBits - 8; s >= 0; s -= 8) write_byte(w.out, static_cast<uint32_t>(v >> s) & 0xFF);
+        w.out = write_word_stuffed(w.out, v);
     }
 }
 
 // Appends the low `size` bits of `code` (nothing above them set); size is at
 // most 26.
-inline void put(BitState& w, uint32_t code, int size) {
-    const int free = w.free - size;
-    if (free >= 0) {
+[[gnu::always_inline]] inline void put(BitState& w, uint32_t code, int size) {
+    w.free -= size;
+    if (__builtin_expect(w.free >= 0, 1)) {
         w.acc = (w.acc << size) | code;
-        w.free = free;
     } else {
         // Fill the word, write it, keep the rest of the code.
-        w.acc = (w.acc << (size + free)) | (code >> -free);
+        w.acc = (w.acc << (size + w.free)) | (code >> -w.free);
         flush_word(w);
         w.acc = code;
-        w.free = free + kAccBits;
+        w.free += kAccBits;
     }
 }
 
@@ -80,8 +86,8 @@ inline void flush_whole_bytes(BitState& w) {
 // One value of magnitude category k: the combined table entry (code already
 // shifted left by k) with the k extra bits, the value itself when positive,
 // the one's complement of its magnitude when negative.
-inline void put_coded(BitState& w, uint32_t entry, int32_t x, int k) {
-    const uint32_t extra = static_cast<uint32_t>(x + (x >> 31)) & ((1u << k) - 1);
+[[gnu::always_inline]] inline void put_coded(BitState& w, uint32_t entry, int32_t x, int k) {
+    const uint32_t extra = static_cast<uint32_t>(x + (x >> 31)) & ~(~0u << k);
     put(w, (entry >> 5) | extra, static_cast<int>(entry & 31));
 }
 
@@ -90,43 +96,202 @@ inline int category(int32_t x) {
     return std::bit_width(static_cast<uint32_t>((x ^ s) - s));
 }
 
-inline int32_t clamp_ac(int32_t x) { return x > 1023 ? 1023 : (x < -1023 ? -1023 : x); }
+// The nonzero bitmap of a block's AC positions, in the order the scan loop
+// consumes it. On 64-bit processors one word, position p at bit p, scanned
+// with count-trailing-zeros; on 32-bit ones two words, position p at bit
+// 31 - p % 32 of word p / 32, scanned with count-leading-zeros, which 32-bit
+// ARM has as one instruction (trailing zeros take two).
+#if UINTPTR_MAX > 0xFFFFFFFFu
+using ScanWord = uint64_t;
+inline constexpr bool kScanFromTop = false;
+#else
+using ScanWord = uint32_t;
+inline constexpr bool kScanFromTop = true;
+#endif
+inline constexpr int kScanWordBits = static_cast<int>(sizeof(ScanWord) * 8);
+inline constexpr int kScanWords = 64 / kScanWordBits;
 
-// Codes a block whose nonzero AC positions (1..62, zig-zag order) are the
-// bits of `mask`; `value(p)` gives the limited value at position p.
-template <typename Value>
-inline void code_block_from_mask(BitState& state, int32_t dc_diff, const uint32_t* dc, const uint32_t* ac,
-                                 uint64_t mask, Value value) {
-    BitState w = state;  // a local copy stays in registers despite the byte stores
+struct ScanMap {
+    ScanWord word[kScanWords];
+};
+
+inline constexpr ScanWord scan_bit(int p) {
+    const int b = p % kScanWordBits;
+    return kScanFromTop ? ScanWord{1} << (kScanWordBits - 1 - b) : ScanWord{1} << b;
+}
+
+// Builds a ScanMap from a 64-bit bitmap with position p at bit p.
+inline ScanMap scan_map_from_bits(uint64_t bits) {
+    ScanMap m{};
+    if constexpr (kScanFromTop) {
+        for (int w = 0; w < kScanWords; ++w) {
+            uint32_t v = static_cast<uint32_t>(bits >> (32 * w));
+            // Bit reversal: position order from the top.
+            v = ((v >> 1) & 0x55555555u) | ((v & 0x55555555u) << 1);
+            v = ((v >> 2) & 0x33333333u) | ((v & 0x33333333u) << 2);
+            v = ((v >> 4) & 0x0F0F0F0Fu) | ((v & 0x0F0F0F0Fu) << 4);
+            m.word[w] = static_cast<ScanWord>(__builtin_bswap32(v));
+        }
+    } else {
+        m.word[0] = static_cast<ScanWord>(bits);
+    }
+    return m;
+}
+
+// Zeros before the first set bit in scan order, and the word with that bit
+// and everything before it consumed (two shifts: the count may be the
+// word's width less one).
+[[gnu::always_inline]] inline int first_set(ScanWord m) {
+    if constexpr (kScanFromTop) return std::countl_zero(m);
+    return std::countr_zero(m);
+}
+[[gnu::always_inline]] inline ScanWord skip_past(ScanWord m, int r) {
+    if constexpr (kScanFromTop) return (m << r) << 1;
+    return (m >> r) >> 1;
+}
+
+// Byte offsets of the coefficient at each zig-zag position in a block in
+// natural order, and in one already in zig-zag order.
+struct ScanOffsets {
+    uint8_t natural[64];
+    uint8_t zigzag[64];
+};
+
+constexpr ScanOffsets make_scan_offsets() {
+    ScanOffsets t{};
+    for (int p = 0; p < 64; ++p) {
+        t.natural[p] = static_cast<uint8_t>(2 * kZigzagToNatural[p]);
+        t.zigzag[p] = static_cast<uint8_t>(2 * p);
+    }
+    return t;
+}
+
+inline constexpr ScanOffsets kScanOffsets = make_scan_offsets();
+
+// Category and extra bits of every AC value the baseline tables can code:
+// entry x + 1023 holds the category in its low byte and the extra bits above.
+struct ValueCodes {
+    uint32_t entry[2047];
+};
+
+constexpr ValueCodes make_value_codes() {
+    ValueCodes t{};
+    for (int x = -1023; x <= 1023; ++x) {
+        int k = 0;
+        for (int a = x < 0 ? -x : x; a != 0; a >>= 1) ++k;
+        const uint32_t extra = static_cast<uint32_t>(x < 0 ? x - 1 : x) & ((1u << k) - 1);
+        t.entry[x + 1023] = static_cast<uint32_t>(k) | extra << 8;
+    }
+    return t;
+}
+
+inline constexpr ValueCodes kValueCodes = make_value_codes();
+
+// A biased value beyond +-1023 as +-1023 (category 10) is biased; out of
+// line, so that the coding loop keeps the sign only where it needs it.
+[[gnu::noinline]] inline uint32_t limited(uint32_t t) { return 0x3FFu ^ static_cast<uint32_t>(static_cast<int32_t>(t) >> 31); }
+
+// Codes a block: the DC difference, then the AC positions set in `map`
+// (positions 1..62 at most), limited to +-1023, then EOB. The value at
+// position p is the int16 at byte offset offsets[p] of `values`. With
+// kInRange the caller has made sure that every AC value lies within
+// +-1023, and category and extra bits come from one table lookup.
+template <bool kInRange>
+[[gnu::always_inline]] inline void code_block_from_map(BitState& state, int32_t dc_diff, const uint32_t* dc,
+                                                      const uint32_t* ac, const ScanMap& map, const int16_t* values,
+                                                      const uint8_t* offsets) {
+    // Word-sized signed counts throughout: no widening in the loop on 64-bit
+    // processors.
+    using Count = intptr_t;
+    BitState w = state;
     {
         const int k = category(dc_diff);
         put_coded(w, dc[k], dc_diff, k);
     }
-    int prev = 0;
-    auto code_at = [&](int p) {
-        int run = p - prev - 1;
-        prev = p;
-        while (run > 15) {
+    const char* base = reinterpret_cast<const char*>(values);
+    const uint32_t* ac_top = ac + 32;  // ac_top[16 * run - z]: the entry of category 32 - z
+    auto code = [&](Count run, const uint8_t* at) __attribute__((always_inline)) {
+        while (run > 15) [[unlikely]] {
             put(w, ac[0xF0] >> 5, static_cast<int>(ac[0xF0] & 31));
             run -= 16;
         }
-        const int32_t x = value(p);
-        const int k = category(x);
-        put_coded(w, ac[(run << 4) + k], x, k);
+        int16_t v;
+        std::memcpy(&v, base + *at, sizeof v);
+        if constexpr (kInRange) {
+            // Category and extra bits by table lookup.
+            const uint32_t value_code = kValueCodes.entry[v + 1023];
+            const uint32_t entry = ac[run * 16 + static_cast<Count>(value_code & 0xFF)];
+            put(w, (entry >> 5) | (value_code >> 8), static_cast<int>(entry & 31));
+        } else {
+            // Computed, which on 32-bit ARM takes fewer steps than the lookup
+            // and its range check: t is the value, less one when negative
+            // (its low bits are the extra bits), t ^ sign the magnitude.
+            const int32_t ts = v + (v >> 31);
+            uint32_t t = static_cast<uint32_t>(ts);
+            Count z = __builtin_clz(t ^ static_cast<uint32_t>(ts >> 31));  // 32 - category; the value is not 0
+            if (__builtin_expect(z < 22, 0)) {
+                t = limited(t);
+                z = 22;
+            }
+            // The entry of category 32 - z.
+            const uint32_t entry = ac_top[run * 16 - z];
+            put(w, (entry >> 5) | ((t << z) >> z), static_cast<int>(entry & 31));
+        }
     };
-#if UINTPTR_MAX > 0xFFFFFFFFu
-    while (mask != 0) {
-        code_at(std::countr_zero(mask));
-        mask &= mask - 1;
+    // `carry`: zeros since the last coded position that belong to the next
+    // run (the DC position counts as coded, hence -1 before position 0).
+    Count carry = -1;
+#pragma GCC unroll 2
+    for (int h = 0; h < kScanWords; ++h) {
+        ScanWord m = map.word[h];
+        if (m == 0) {
+            carry += kScanWordBits;
+            continue;
+        }
+        const uint8_t* at = offsets + h * kScanWordBits - 1;  // last position consumed
+        Count r = first_set(m);
+        m = skip_past(m, static_cast<int>(r));
+        at += r + 1;
+        code(r + carry, at);
+        while (m != 0) {
+            // The word was shifted by one at least, so r + 1 is below its
+            // width and one shift does.
+            r = first_set(m);
+            const Count step = r + 1;
+            m = kScanFromTop ? m << step : m >> step;
+            at += step;
+            code(r, at);
+        }
+        carry = offsets + (h + 1) * kScanWordBits - 1 - at;
     }
-#else
-    // Two 32-bit halves: 64-bit bit scans are several instructions here.
-    for (uint32_t m = static_cast<uint32_t>(mask); m != 0; m &= m - 1) code_at(std::countr_zero(m));
-    for (uint32_t m = static_cast<uint32_t>(mask >> 32); m != 0; m &= m - 1) code_at(32 + std::countr_zero(m));
-#endif
     put(w, ac[0] >> 5, static_cast<int>(ac[0] & 31));  // EOB
     state = w;
 }
+
+// The kernels of one target from its inline block coder: one block out of
+// line, and the blocks of an MCU in one loop, so that the accumulator stays
+// in registers from block to block.
+template <void (*kCodeBlock)(BitState&, int32_t, const int16_t*, const uint32_t*, const uint32_t*)>
+struct KernelsOf {
+    static void block(BitState& bits, int32_t dc_diff, const int16_t* blk, const uint32_t* dc, const uint32_t* ac) {
+        kCodeBlock(bits, dc_diff, blk, dc, ac);
+    }
+    static void mcu(BitState& bits, const CoderTables& t, int16_t* const* blocks, int32_t* last_dc) {
+        BitState w = bits;
+        for (uint32_t n = 0; n < t.blocks_in_mcu; ++n) {
+            const uint32_t c = t.block_comp[n];
+            int16_t* blk = blocks[n];
+            int32_t diff = blk[0] - last_dc[c];
+            // The pixel path never exceeds category 11; a caller's blocks might.
+            diff = diff > 2047 ? 2047 : (diff < -2047 ? -2047 : diff);
+            kCodeBlock(w, diff, blk, t.dc[t.block_dc[n]], t.ac[t.block_ac[n]]);
+            blk[kZigzagToNatural[63]] = 0;
+            last_dc[c] = blk[0];
+        }
+        bits = w;
+    }
+    static constexpr CoderKernels kernels{block, mcu};
+};
 
 }  // namespace
 }  // namespace tekoj

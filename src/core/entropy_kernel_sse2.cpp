@@ -1,13 +1,16 @@
 // SSE2 block kernel: the AC coefficients gathered into zig-zag order with
-// word inserts, limited to +-1023 and tested against zero eight at a time.
+// word inserts, limited to +-1023 (so that the coding loop looks category
+// and extra bits up) and tested against zero eight at a time.
 #if defined(__x86_64__)
 #include "core/entropy_kernel.h"
 
 #include <emmintrin.h>
 
 namespace tekoj {
+namespace {
 
-void code_block_sse2(BitState& bits, int32_t dc_diff, const int16_t* block, const uint32_t* dc, const uint32_t* ac) {
+[[gnu::always_inline]] inline void code_block(BitState& bits, int32_t dc_diff, const int16_t* block, const uint32_t* dc,
+                                              const uint32_t* ac) {
     alignas(16) int16_t zz[64];
     const __m128i limit = _mm_set1_epi16(1023), neg_limit = _mm_set1_epi16(-1023), zero = _mm_setzero_si128();
     uint64_t zeros = 0;
@@ -25,8 +28,12 @@ void code_block_sse2(BitState& bits, int32_t dc_diff, const int16_t* block, cons
         zeros |= static_cast<uint64_t>(static_cast<uint32_t>(_mm_movemask_epi8(z))) << (8 * r);
     }
     const uint64_t mask = ~zeros & 0x7FFFFFFFFFFFFFFEull;
-    code_block_from_mask(bits, dc_diff, dc, ac, mask, [&zz](int p) { return static_cast<int32_t>(zz[p]); });
+    code_block_from_map<true>(bits, dc_diff, dc, ac, ScanMap{{mask}}, zz, kScanOffsets.zigzag);
 }
+
+}  // namespace
+
+CoderKernels coder_kernels_sse2() { return KernelsOf<code_block>::kernels; }
 
 }  // namespace tekoj
 #endif

@@ -4,7 +4,9 @@ namespace tekoj {
 
 void prepare_quant_table(const uint32_t* divisors, QuantTable& table) {
     table.divisors = divisors;
+    table.narrow = true;
     for (int i = 0; i < 64; ++i) {
+        table.narrow = table.narrow && divisors[i] < 32768;
         table.mul[i] = static_cast<int16_t>(static_cast<uint16_t>(divisors[i] & 0xFFFF));
         table.wide[i] = static_cast<int16_t>(divisors[i] >= 32768 ? -1 : 0);
     }
@@ -15,6 +17,25 @@ void fdct_blocks_portable(const uint8_t* const* rows, uint32_t col, uint32_t cou
     const uint32_t* d = quant.divisors;
     for (uint32_t b = 0; b < count; ++b, col += 8, out += 64)
         dct_detail::block(rows, col, [d](int i, int32_t x) { return dct_detail::quantise(x, d[i]); }, out);
+}
+
+void quantise_blocks_portable(const int16_t* x, uint32_t count, const QuantTable& quant, int16_t* out) {
+    for (uint32_t i = 0; i < 64 * count; ++i) out[i] = dct_detail::quantise(x[i], quant.divisors[i % 64]);
+}
+
+QuantiseBlocksFn quantise_blocks_for(SimdLevel level) {
+    if (!simd_supported(level)) return quantise_blocks_portable;
+    switch (level) {
+#if defined(__x86_64__) || (defined(__i386__) && defined(__SSE2__))
+        case SimdLevel::sse2: return quantise_blocks_sse2;
+        case SimdLevel::avx2:
+        case SimdLevel::avx512: return quantise_blocks_avx2;
+#endif
+#if defined(__arm__) || defined(__aarch64__)
+        case SimdLevel::neon: return quantise_blocks_neon;
+#endif
+        default: return quantise_blocks_portable;
+    }
 }
 
 FdctBlocksFn fdct_blocks_for(SimdLevel level) {

@@ -84,11 +84,15 @@ constexpr uint32_t kMaxKernelDivisor = 65536;
 // the 32-bit divisor words: `divisors` itself (portable, NEON), and for the
 // 16-bit lanes of SSE2/AVX2 the low half of each word (`mul`) and a mask
 // that is all ones where the word is 32768 or more (`wide`): then
-// x * m = x * int16(mul) + (x & wide) * 65536.
+// x * m = x * int16(mul) + (x & wide) * 65536. `narrow` tells that every
+// word is below 32768 (quantiser steps of 3 and more in the transform's
+// scale, every table up to quality 90 or so), so `mul` holds the words
+// themselves and no lane needs the wide correction.
 struct QuantTable {
     const uint32_t* divisors;
     alignas(32) int16_t mul[64];
     alignas(32) int16_t wide[64];
+    bool narrow;
 };
 
 void prepare_quant_table(const uint32_t* divisors, QuantTable& table);
@@ -113,5 +117,18 @@ void fdct_blocks_avx2(const uint8_t* const* rows, uint32_t col, uint32_t count, 
                       int16_t* out);
 void fdct_blocks_neon(const uint8_t* const* rows, uint32_t col, uint32_t count, const QuantTable& quant,
                       int16_t* out);
+
+// Quantises `count` blocks of column-pass outputs x (natural order) exactly
+// as the transform kernel of `level` does (the portable quantisation for
+// levels this build or processor lacks): the tests sweep every 16-bit value
+// against every quantiser step through it. Every divisor word must be at
+// most kMaxKernelDivisor.
+using QuantiseBlocksFn = void (*)(const int16_t* x, uint32_t count, const QuantTable& quant, int16_t* out);
+QuantiseBlocksFn quantise_blocks_for(SimdLevel level);
+
+void quantise_blocks_portable(const int16_t* x, uint32_t count, const QuantTable& quant, int16_t* out);
+void quantise_blocks_sse2(const int16_t* x, uint32_t count, const QuantTable& quant, int16_t* out);
+void quantise_blocks_avx2(const int16_t* x, uint32_t count, const QuantTable& quant, int16_t* out);
+void quantise_blocks_neon(const int16_t* x, uint32_t count, const QuantTable& quant, int16_t* out);
 
 }  // namespace tekoj

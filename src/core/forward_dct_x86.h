@@ -115,6 +115,13 @@ inline void transform8x8(V (&d)[8]) {
     butterfly8<false>(d);
 }
 
+// Quantisation of one row v of a block on 128-bit registers.
+inline __m128i quantise_row_128(__m128i x, const QuantTable& quant, int v) {
+    const __m128i mul = _mm_load_si128(reinterpret_cast<const __m128i*>(quant.mul + 8 * v));
+    const __m128i wide = _mm_load_si128(reinterpret_cast<const __m128i*>(quant.wide + 8 * v));
+    return quantise16(x, mul, wide);
+}
+
 // One block on 128-bit registers.
 inline void fdct_block_128(const uint8_t* const* rows, uint32_t col, const QuantTable& quant, int16_t* out) {
     const __m128i zero = _mm_setzero_si128();
@@ -122,11 +129,8 @@ inline void fdct_block_128(const uint8_t* const* rows, uint32_t col, const Quant
     for (int y = 0; y < 8; ++y)
         d[y] = _mm_unpacklo_epi8(_mm_loadl_epi64(reinterpret_cast<const __m128i*>(rows[y] + col)), zero);
     transform8x8(d);
-    for (int v = 0; v < 8; ++v) {
-        const __m128i mul = _mm_load_si128(reinterpret_cast<const __m128i*>(quant.mul + 8 * v));
-        const __m128i wide = _mm_load_si128(reinterpret_cast<const __m128i*>(quant.wide + 8 * v));
-        _mm_storeu_si128(reinterpret_cast<__m128i*>(out + 8 * v), quantise16(d[v], mul, wide));
-    }
+    for (int v = 0; v < 8; ++v)
+        _mm_storeu_si128(reinterpret_cast<__m128i*>(out + 8 * v), quantise_row_128(d[v], quant, v));
 }
 
 }  // namespace

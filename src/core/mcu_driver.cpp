@@ -20,11 +20,16 @@ inline void dummy_block(int16_t* blk, int16_t dc) {
 
 }  // namespace
 
+// The driver transforms runs of MCUs ahead of the coder: one kernel call per
+// block row of a component covers the whole run, so the call and the
+// kernel's set-up are paid once per run rather than once per block. The
+// run's coefficients live on the stack (kRunBlocks blocks, 7.5 KiB).
+constexpr uint32_t kRunBlocks = 60;
+
 bool compress_band(EncoderContext* ctx, uint8_t** const* row_arrays) {
     McuState* st = ctx->mcu_state;
     const uint32_t last_col = ctx->mcus_per_row - 1;
-    const uint32_t last_band = ctx->total_imcu_rows - 1;
-    int16_t* const* mcu = st->mcu_buffer;
+    const bool last_band = st->imcu_row == ctx->total_imcu_rows - 1;
     // The transform kernel of the process's SIMD level, and the scan's
     // quantisation tables in the forms it takes (prepared once per band).
     const FdctBlocksFn fdct = fdct_blocks();
@@ -34,34 +39,49 @@ bool compress_band(EncoderContext* ctx, uint8_t** const* row_arrays) {
         const uint8_t t = ctx->cur_comp_info[c]->quant_tbl_no;
         if (quant[t].divisors != ctx->divisors[t]) prepare_quant_table(ctx->divisors[t], quant[t]);
     }
+    const uint32_t run_mcus = kRunBlocks / ctx->blocks_in_mcu;
+    alignas(16) int16_t coef[kRunBlocks * 64];
     // One coder for the whole band: the accumulator carries over from MCU to
     // MCU and is written out a whole word at a time.
     RowCoder coder;
     begin_coding(coder, ctx);
     for (uint32_t y = st->mcu_vert_offset; y < st->mcu_rows_per_imcu_row; ++y) {
-        for (uint32_t x = st->mcu_ctr; x <= last_col; ++x) {
-            uint32_t blkn = 0;
+        for (uint32_t x0 = st->mcu_ctr; x0 <= last_col;) {
+            const uint32_t n = last_col + 1 - x0 < run_mcus ? last_col + 1 - x0 : run_mcus;
+            // Strip k holds block row r of component c for the n MCUs, in MCU
+            // block order; width[k] blocks per MCU.
+            int16_t* strip[10];
+            uint32_t width[10];
+            uint32_t k = 0;
+            int16_t* next = coef;
             for (int c = 0; c < ctx->comps_in_scan; ++c) {
                 const ComponentInfo* comp = ctx->cur_comp_info[c];
-                const uint32_t count = x < last_col ? comp->mcu_width : comp->last_col_width;
-                const uint32_t start_col = x * comp->mcu_sample_width;
-                uint32_t start_row = y * 8;
-                uint8_t* const* rows = row_arrays[comp->component_index];
-                const QuantTable& q = quant[comp->quant_tbl_no];
-                for (uint32_t r = 0; r < comp->mcu_height; ++r) {
-                    if (st->imcu_row < last_band || y + r < comp->last_row_height) {
-                        fdct(rows + start_row, start_col, count, q, mcu[blkn]);
-                        for (uint32_t j = count; j < comp->mcu_width; ++j)
-                            dummy_block(mcu[blkn + j], mcu[blkn + j - 1][0]);
+                const uint32_t w = comp->mcu_width, blocks = n * w;
+                const uint32_t count = x0 + n - 1 < last_col ? blocks : blocks - w + comp->last_col_width;
+                uint8_t* const* rows = row_arrays[comp->component_index] + y * 8;
+                for (uint32_t r = 0; r < comp->mcu_height; ++r, ++k, next += 64 * blocks, rows += 8) {
+                    strip[k] = next;
+                    width[k] = w;
+                    if (!last_band || y + r < comp->last_row_height) {
+                        fdct(rows, x0 * comp->mcu_sample_width, count, quant[comp->quant_tbl_no], next);
+                        // Blocks past the right edge repeat the DC to their left.
+                        for (uint32_t j = count; j < blocks; ++j) dummy_block(next + 64 * j, next[64 * (j - 1)]);
                     } else {
-                        for (uint32_t j = 0; j < comp->mcu_width; ++j)
-                            dummy_block(mcu[blkn + j], mcu[blkn - 1][0]);
+                        // Rows below the image repeat the DC of the MCU's block
+                        // before them in coding order.
+                        for (uint32_t j = 0; j < blocks; ++j)
+                            dummy_block(next + 64 * j, strip[k - 1][64 * ((j / w) * width[k - 1] + width[k - 1] - 1)]);
                     }
-                    blkn += comp->mcu_width;
-                    start_row += 8;
                 }
             }
-            if (!code_mcu(coder, *ctx->coder_tables, mcu)) return false;
+            for (uint32_t i = 0; i < n; ++i) {
+                int16_t* mcu[10];
+                uint32_t blkn = 0;
+                for (uint32_t s = 0; s < k; ++s)
+                    for (uint32_t h = 0; h < width[s]; ++h) mcu[blkn++] = strip[s] + 64 * (i * width[s] + h);
+                if (!code_mcu(coder, *ctx->coder_tables, mcu)) return false;
+            }
+            x0 += n;
         }
         st->mcu_ctr = 0;
     }

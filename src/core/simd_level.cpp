@@ -3,6 +3,10 @@
 #include <cstdlib>
 #include <cstring>
 
+#if defined(__x86_64__) || defined(__i386__)
+#include <cpuid.h>
+#endif
+
 #if defined(__arm__) && defined(__linux__)
 #include <sys/auxv.h>
 #ifndef HWCAP_NEON
@@ -16,8 +20,15 @@ namespace {
 SimdLevel detect() {
 #if defined(__x86_64__) || defined(__i386__)
     __builtin_cpu_init();
-    if (__builtin_cpu_supports("avx512f") && __builtin_cpu_supports("avx512bw")) return SimdLevel::avx512;
-    if (__builtin_cpu_supports("avx2")) return SimdLevel::avx2;
+    // The AVX2 kernels (which the AVX-512 level runs too) are built with the
+    // bit-manipulation sets every AVX2 processor has, unless a hypervisor
+    // hides them: then the SSE2 level.
+    unsigned a = 0, b = 0, c = 0, d = 0;
+    const bool lzcnt = __get_cpuid(0x80000001u, &a, &b, &c, &d) != 0 && (c & (1u << 5)) != 0;
+    const bool bits = lzcnt && __builtin_cpu_supports("bmi") && __builtin_cpu_supports("bmi2") &&
+                      __builtin_cpu_supports("popcnt");
+    if (bits && __builtin_cpu_supports("avx512f") && __builtin_cpu_supports("avx512bw")) return SimdLevel::avx512;
+    if (bits && __builtin_cpu_supports("avx2")) return SimdLevel::avx2;
     if (__builtin_cpu_supports("sse2")) return SimdLevel::sse2;
     return SimdLevel::portable;
 #elif defined(__arm__) && defined(__linux__)

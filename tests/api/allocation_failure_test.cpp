@@ -12,35 +12,12 @@
 
 #include <gtest/gtest.h>
 
-#include <filesystem>
 #include <iostream>
 #include <string>
 
 using namespace tekoj_test;
 
 namespace {
-
-size_t open_descriptors() {
-    using std::filesystem::directory_iterator;
-    return size_t(std::distance(directory_iterator("/proc/self/fd"), directory_iterator{}));
-}
-
-// Checks when it goes that no block leaked and no file stayed open meanwhile.
-struct NoLeak {
-    FaultScope scope;
-    int64_t live = live_blocks();
-    size_t fds = open_descriptors();
-    ~NoLeak() {
-        EXPECT_EQ(live_blocks(), live);
-        EXPECT_EQ(open_descriptors(), fds);
-    }
-};
-
-Bytes noise(size_t n, uint32_t seed) {
-    Bytes b(n);
-    for (auto& v : b) v = static_cast<uint8_t>((seed = seed * 1664525u + 1013904223u) >> 24);
-    return b;
-}
 
 const std::string kPath = temp_path("faults.jpg");
 

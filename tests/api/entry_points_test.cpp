@@ -1,6 +1,8 @@
 // Whole-image entry points: streams decode cleanly for every format, size and
 // quality; every output kind yields the same bytes; bands coded by separate
-// calls join to the one-call stream; concurrent calls do not interfere.
+// calls join to the one-call stream; concurrent calls do not interfere;
+// memory targets grow by 4096 bytes, then geometrically, keeping the bytes
+// written and never writing past their capacity.
 #include <TekoJEncoderInternal.h>
 
 #include "support/fault_os_layer.h"
@@ -72,13 +74,16 @@ TEST(EntryPoints, EveryFormatSizeAndQualityDecodesAboveThePsnrFloor) {
 TEST(EntryPoints, EverySmallSizeFormatQualityAndOutputKindDecodesCleanlyAndAgrees) {
     // Every width and height 1..48: partial blocks, partial MCUs and last
     // bands of every height. Tiles of saturated blue beside saturated yellow
-    // put chroma DC differences in the largest category (11). The memory
-    // stream is the reference; the other members take turns.
+    // put chroma DC differences in the largest category (11); tiles of noise
+    // at quality 100 are the densest data the coder can be given, so memory
+    // targets grow from short blocks (the sanitizer build turns a write past
+    // a block into a failure). The memory stream is the reference; the other
+    // members take turns.
     const std::string path = temp_path("small.jpg");
     int turn = 0;
     for (int w = 1; w <= 48; ++w)
         for (int h = 1; h <= 48; ++h) {
-            Bytes rgb = photo_rgb(w, h, 3);
+            Bytes rgb = noise(size_t(w) * h * 3, uint32_t(w * 64 + h));
             for (int y = 0; y < h; ++y)
                 for (int x = 0; x < w; ++x) {
                     const int tile = (x / 16 + y / 16) % 3;
@@ -191,4 +196,40 @@ TEST(BandMode, RefusesBandWordsThatCannotDescribeOneStream) {
         EXPECT_EQ(live_blocks(), live);  // the caller's block is still the caller's
         DORVATEKO_OsFree(block);
     }
+}
+
+TEST(MemoryTarget, GrowsBy4096ThenGeometricallyKeepingTheBytesWritten) {
+    // One MCU per band, so that every growth is seen.
+    const Bytes px = noise(image_size(EKO_FORMAT_YUV420, 16, 512), 21);
+    const ImageInfo info = image_info(px.data(), 16, 512, EKO_FORMAT_YUV420);
+    Context c(info, nullptr, 100);
+    EncoderContext* const ctx = c.ctx;
+    ASSERT_NE(ctx, nullptr);
+    ASSERT_EQ(__eko_jpeg_enc_make_header(ctx), 1u);
+    const OutputTarget* t = ctx->output;
+    const Bytes header(t->buffer, t->buffer + t->used);
+    std::vector<uint32_t> capacities{t->capacity};
+    for (; ctx->next_row < 512; ctx->next_row = static_cast<uint16_t>(ctx->next_row + 16)) {
+        EXPECT_EQ(__eko_jpeg_enc_process_image_data(ctx), 1u);
+        EXPECT_TRUE(t->total <= t->used && t->used <= t->capacity);
+        EXPECT_TRUE(std::equal(header.begin(), header.end(), t->buffer));
+        if (t->capacity != capacities.back()) capacities.push_back(t->capacity);
+    }
+    EXPECT_EQ(__eko_jpeg_enc_make_end_mark(ctx), 1u);
+    EXPECT_EQ(Bytes(t->buffer, t->buffer + t->total), encode_to_memory(info, 100));
+    // Completion makes its own room for the pad byte, its stuffing and EOI,
+    // whatever room the coding left.
+    const Bytes small = noise(image_size(EKO_FORMAT_GREY, 8, 8), 5);
+    const ImageInfo tiny = image_info(small.data(), 8, 8, EKO_FORMAT_GREY);
+    for (uint32_t room = 0; room <= 12; ++room) {
+        Context e(tiny, nullptr, 100);
+        ASSERT_TRUE(e.ctx != nullptr && __eko_jpeg_enc_make_header(e.ctx) == 1 && __eko_jpeg_enc_process_image_data(e.ctx) == 1);
+        e->output->capacity = e->output->used + room;  // the block is larger; only the bookkeeping says less
+        EXPECT_TRUE(__eko_jpeg_enc_make_end_mark(e.ctx) == 1 && e->output->used <= e->output->capacity) << room;
+        EXPECT_EQ(Bytes(e->output->buffer, e->output->buffer + e->output->total), encode_to_memory(tiny, 100)) << room;
+    }
+    ASSERT_GE(capacities.size(), 5u);
+    EXPECT_TRUE(capacities[0] == 2048 && capacities[1] == 6144);  // the first growth adds 4096
+    for (size_t i = 1; i < capacities.size(); ++i)
+        EXPECT_GE(capacities[i], capacities[i - 1] + std::max(4096u, capacities[i - 1] / 2)) << i;
 }

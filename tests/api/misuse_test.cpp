@@ -10,7 +10,6 @@
 
 #include <algorithm>
 #include <cstring>
-#include <filesystem>
 #include <functional>
 #include <string>
 #include <thread>
@@ -19,48 +18,17 @@ using namespace tekoj_test;
 
 namespace {
 
-size_t open_descriptors() {
-    using std::filesystem::directory_iterator;
-    return size_t(std::distance(directory_iterator("/proc/self/fd"), directory_iterator{}));
-}
-
 uint32_t ignore(void*, const uint8_t*, uint32_t) { return 1; }
 
 // Runs a refused call and checks what every refusal shares.
 void expect_refused(const std::function<uint32_t()>& call, uint32_t error) {
-    const int64_t live = live_blocks();
-    const size_t fds = open_descriptors();
+    NoLeak no_leak;
     eko_SetError(99);  // a stale reason the refusal must replace with its own
     EXPECT_EQ(call(), 0u);
     EXPECT_EQ(eko_GetLastError(), error);
-    EXPECT_EQ(live_blocks(), live);
-    EXPECT_EQ(open_descriptors(), fds);
 }
 
-// A whole encode through the exported steps, with an EncoderSettings record;
-// empty when creation refuses it.
-Bytes encode_with_settings(const ImageInfo& info, const EncoderSettings* settings) {
-    const OutputRequest request{EKO_OUTPUT_MEMORY, nullptr, nullptr, 0};
-    const EncodeOptions options{75, nullptr, 0};
-    EncoderContext* ctx = __eko_jpeg_enc_initiaize(&info, &request, &options, settings);
-    if (ctx == nullptr) return {};
-    EXPECT_EQ(__eko_jpeg_enc_make_header(ctx), 1u);
-    for (; ctx->next_row < uint32_t(ctx->height); ctx->next_row = uint16_t(ctx->next_row + ctx->max_v_samp * 8))
-        EXPECT_EQ(__eko_jpeg_enc_process_image_data(ctx), 1u);
-    EXPECT_EQ(__eko_jpeg_enc_make_end_mark(ctx), 1u);
-    Bytes out(ctx->output->buffer, ctx->output->buffer + ctx->output->total);
-    DORVATEKO_OsFree(ctx->output->buffer);
-    __eko_jpeg_enc_release_mem(ctx);
-    DORVATEKO_OsFree(ctx);
-    return out;
-}
-
-EncoderSettings settings_420() {
-    EncoderSettings s{3, {}, 2, {}, {}, 1, 0, {{0, 2, 2}, {1, 1, 1}, {1, 1, 1}}};
-    std::memcpy(s.quant_tables[0], eko_luminanceQuantTbl[0], 64);
-    std::memcpy(s.quant_tables[1], eko_chrominanceQuantTbl[0], 64);
-    return s;
-}
+EncoderSettings settings_420() { return settings(0, 1, 2, 2, 50); }
 
 uint8_t g_mark;
 
@@ -78,12 +46,6 @@ std::function<uint32_t()> on_block(bool ex, const ImageInfo* info, const EncodeO
         if (block != &g_mark) DORVATEKO_OsFree(block);
         return r;
     };
-}
-
-// Index of the first FF code pair in a stream, or its size.
-size_t find_marker(const Bytes& j, uint8_t code) {
-    const uint8_t marker[2] = {0xFF, code};
-    return size_t(std::search(j.begin(), j.end(), marker, marker + 2) - j.begin());
 }
 
 }  // namespace
@@ -206,9 +168,9 @@ TEST(Creation, RefusesSettingsThatTheGeometryCannotServe) {
         const ImageInfo info = image_info(px.data(), 48, 40, row.format);
         EncoderSettings s = settings_420();
         // The unchanged record is accepted.
-        if (row.format != EKO_FORMAT_GREY) { EXPECT_TRUE(decode_jpeg(encode_with_settings(info, &s)).ok); }
+        if (row.format != EKO_FORMAT_GREY) { EXPECT_TRUE(decode_jpeg(encode_in_steps(info, &s)).ok); }
         row.change(s);
-        expect_refused([&] { return encode_with_settings(info, &s).empty() ? 0u : 1u; }, EKO_ERR_SAMPLING);
+        expect_refused([&] { return encode_in_steps(info, &s).empty() ? 0u : 1u; }, EKO_ERR_SAMPLING);
     }
 }
 
@@ -219,14 +181,14 @@ TEST(Creation, SettingsForOneComponentOrWithoutDriAreFollowed) {
     const Bytes grey = rgb_to_grey(rgb, 37, 48), yuv = rgb_to_yuv420(rgb, 37, 48);
     EncoderSettings s = settings_420();
     s.num_components = 1;
-    const Bytes reference = encode_with_settings(image_info(grey.data(), 37, 48, EKO_FORMAT_GREY), &s);
+    const Bytes reference = encode_in_steps(image_info(grey.data(), 37, 48, EKO_FORMAT_GREY), &s);
     EXPECT_TRUE(decode_jpeg(reference).ok && !decode_jpeg(reference).warning);
     for (uint8_t f : {1, 2}) {
         for (uint32_t format : {EKO_FORMAT_GREY, EKO_FORMAT_YUV420}) {
             SCOPED_TRACE(std::to_string(f) + "x" + std::to_string(f) + " format " + std::to_string(format));
             s.component_specs[0][1] = s.component_specs[0][2] = f;
             const uint8_t* data = format == EKO_FORMAT_GREY ? grey.data() : yuv.data();
-            const Bytes jpeg = encode_with_settings(image_info(data, 37, 48, format), &s);
+            const Bytes jpeg = encode_in_steps(image_info(data, 37, 48, format), &s);
             const size_t sof = find_marker(jpeg, 0xC0);
             ASSERT_LT(sof + 11, jpeg.size());
             EXPECT_TRUE(jpeg[sof + 9] == 1 && jpeg[sof + 11] == 0x11);  // one component, 1x1
@@ -238,13 +200,13 @@ TEST(Creation, SettingsForOneComponentOrWithoutDriAreFollowed) {
     s.num_quant_tables = 4, s.component_specs[1][0] = 2, s.component_specs[2][0] = 3;
     std::memcpy(s.quant_tables[2], eko_chrominanceQuantTbl[3], 64);
     std::memcpy(s.quant_tables[3], eko_chrominanceQuantTbl[6], 64);
-    const Bytes four = encode_with_settings(image_info(yuv.data(), 37, 48, EKO_FORMAT_YUV420), &s);
+    const Bytes four = encode_in_steps(image_info(yuv.data(), 37, 48, EKO_FORMAT_YUV420), &s);
     EXPECT_TRUE(decode_jpeg(four).ok && !decode_jpeg(four).warning && find_marker(four, 0xDB) < four.size());
     // write_dri 0: neither a DRI segment nor restart markers.
     const ImageInfo colour = image_info(yuv.data(), 37, 48, EKO_FORMAT_YUV420);
     s = settings_420();
     s.write_dri = 0;
-    const Bytes jpeg = encode_with_settings(colour, &s);
+    const Bytes jpeg = encode_in_steps(colour, &s);
     for (uint8_t code : {0xDD, 0xD0, 0xD1, 0xD2, 0xD7}) EXPECT_EQ(find_marker(jpeg, code), jpeg.size()) << int(code);
     EXPECT_FALSE(decode_jpeg(jpeg).warning);
 }
@@ -253,15 +215,10 @@ TEST(Creation, PlaneOffsetsOfTheLargestImageDoNotOverflow) {
     // 49999 x 49999 passes 2^31 bytes; creation only places the plane pointers.
     static const uint8_t anchor[1] = {0};
     const ImageInfo info = image_info(anchor, 49999, 49999, EKO_FORMAT_YUV420);
-    const OutputRequest request{EKO_OUTPUT_STREAM, nullptr, nullptr, 0};
-    const EncodeOptions options{75, nullptr, 0};
-    EncoderContext* ctx = __eko_jpeg_enc_initiaize(&info, &request, &options, nullptr);
-    ASSERT_NE(ctx, nullptr);
-    EXPECT_EQ(uintptr_t(ctx->plane_u) - uintptr_t(anchor), uintptr_t{49999} * 49999);
-    EXPECT_EQ(uintptr_t(ctx->plane_v) - uintptr_t(anchor), uintptr_t{49999} * 49999 + uintptr_t{25000} * 25000);
-    DORVATEKO_OsFree(ctx->work_buffer);
-    __eko_jpeg_enc_release_mem(ctx);
-    DORVATEKO_OsFree(ctx);
+    Context c(info);
+    ASSERT_NE(c.ctx, nullptr);
+    EXPECT_EQ(uintptr_t(c->plane_u) - uintptr_t(anchor), uintptr_t{49999} * 49999);
+    EXPECT_EQ(uintptr_t(c->plane_v) - uintptr_t(anchor), uintptr_t{49999} * 49999 + uintptr_t{25000} * 25000);
 }
 
 TEST(ErrorCode, EveryCallThatSucceedsReportsNoError) {

@@ -73,7 +73,9 @@ EncoderContext* context_for(const ImageInfo& info, uint32_t quality, tekoj::Simd
     const OutputRequest request{EKO_OUTPUT_MEMORY, nullptr, static_cast<uint8_t*>(DORVATEKO_OsMalloc(4096)), 4096};
     const EncodeOptions options{quality, nullptr, 0};
     EncoderContext* ctx = __eko_jpeg_enc_initiaize(&info, &request, &options, nullptr);
-    ctx->coder_tables->kernel = tekoj::block_kernel_for(static_cast<int>(level));
+    const tekoj::CoderKernels kernels = tekoj::coder_kernels_for(static_cast<int>(level));
+    ctx->coder_tables->kernel = kernels.block;
+    ctx->coder_tables->mcu_kernel = kernels.mcu;
     return ctx;
 }
 
@@ -93,14 +95,14 @@ TEST(BlockKernels, EveryLevelCodesThePortableBytesFromEveryAccumulatorState) {
     const Bytes px(64, 0x80);
     EncoderContext* ctx = context_for(image_info(px.data(), 8, 8, EKO_FORMAT_GREY), 75, tekoj::SimdLevel::portable);
     const tekoj::CoderTables* t = ctx->coder_tables;
-    const tekoj::BlockKernel portable = tekoj::block_kernel_for(static_cast<int>(tekoj::SimdLevel::portable));
+    const tekoj::BlockKernel portable = tekoj::coder_kernels_for(static_cast<int>(tekoj::SimdLevel::portable)).block;
     for (tekoj::SimdLevel level : fast_levels()) {
         SCOPED_TRACE(tekoj::simd_level_name(level));
         for (int table = 0; table < 2; ++table) {
             for (int pending : {0, 1, 7, 8, 31, static_cast<int>(sizeof(tekoj::BitAcc) * 8) - 1}) {
                 tekoj::BitState a{}, b{};
                 const Bytes want = run_kernel(portable, blocks, t->dc[table], t->ac[table], pending, a);
-                const Bytes got = run_kernel(tekoj::block_kernel_for(static_cast<int>(level)), blocks, t->dc[table],
+                const Bytes got = run_kernel(tekoj::coder_kernels_for(static_cast<int>(level)).block, blocks, t->dc[table],
                                              t->ac[table], pending, b);
                 EXPECT_EQ(got, want) << "table " << table << ", " << pending << " bits waiting";
                 const int left = static_cast<int>(sizeof(tekoj::BitAcc) * 8) - a.free;

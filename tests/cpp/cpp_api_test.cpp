@@ -37,6 +37,33 @@ Planes yuv420_planes(int w, int h, uint32_t seed) {
             Bytes(i420.begin() + ys + cs, i420.end())};
 }
 
+// The planes as NV21 or NV12 (chroma rows of `stride` bytes after the tight
+// luma plane), or as YUYV or UYVY rows of `stride` bytes, each luma row with
+// the chroma of its pair's upper row; padding shows as 0x5A.
+Bytes yuv_layout(const Planes& p, int w, int h, PixelFormat f, size_t stride) {
+    const size_t cw = (w + 1) / 2, ch = (h + 1) / 2;
+    if (f == PixelFormat::nv21 || f == PixelFormat::nv12) {
+        Bytes out = p.y;
+        out.resize(p.y.size() + stride * ch, 0x5A);
+        for (size_t r = 0; r < ch; ++r)
+            for (size_t x = 0; x < cw; ++x) {
+                uint8_t* pair = &out[p.y.size() + r * stride + 2 * x];
+                pair[f == PixelFormat::nv12] = p.v[r * cw + x];
+                pair[f == PixelFormat::nv21] = p.u[r * cw + x];
+            }
+        return out;
+    }
+    Bytes out(stride * h, 0x5A);
+    for (int r = 0; r < h; ++r)
+        for (int x = 0; x + 1 < w; x += 2) {
+            const uint8_t y0 = p.y[r * w + x], y1 = p.y[r * w + x + 1];
+            const uint8_t u = p.u[(r / 2) * cw + x / 2], v = p.v[(r / 2) * cw + x / 2];
+            const uint8_t yuyv[4] = {y0, u, y1, v}, uyvy[4] = {u, y0, v, y1};
+            std::memcpy(&out[r * stride + 2 * x], f == PixelFormat::yuyv ? yuyv : uyvy, 4);
+        }
+    return out;
+}
+
 Bytes c_api_stream(const void* data, int w, int h, uint32_t format, uint32_t quality) {
     return tekoj_test::encode_to_memory(tekoj_test::image_info(data, w, h, format), quality);
 }
@@ -85,7 +112,7 @@ TEST(CppApi, SemiPlanarAndPacked422MatchTheirPlanarEquivalent) {
         for (const int h : {1, 16, 23}) {
             SCOPED_TRACE(testing::Message() << w << "x" << h);
             const Planes p = yuv420_planes(w, h, uint32_t(w * h));
-            const size_t cw = (w + 1) / 2, ch = (h + 1) / 2;
+            const size_t cw = (w + 1) / 2;
             Bytes i420 = p.y;
             i420.insert(i420.end(), p.u.begin(), p.u.end());
             i420.insert(i420.end(), p.v.begin(), p.v.end());
@@ -94,39 +121,17 @@ TEST(CppApi, SemiPlanarAndPacked422MatchTheirPlanarEquivalent) {
             enc.quality(70);
 
             const size_t ystride = w + 9, cstride = 2 * cw + 6;
-            Bytes vu(cstride * ch, 0x11), uv(cstride * ch, 0x22);
-            for (size_t r = 0; r < ch; ++r)
-                for (size_t x = 0; x < cw; ++x) {
-                    vu[r * cstride + 2 * x] = uv[r * cstride + 2 * x + 1] = p.v[r * cw + x];
-                    vu[r * cstride + 2 * x + 1] = uv[r * cstride + 2 * x] = p.u[r * cw + x];
-                }
             const Bytes y = pad_rows(p.y.data(), w, h, ystride);
-            EXPECT_EQ(enc.encode(ImageView::semi_planar(PixelFormat::nv21, w, h, y.data(), ystride, vu.data(), cstride)),
-                      expected);
-            EXPECT_EQ(enc.encode(ImageView::semi_planar(PixelFormat::nv12, w, h, y.data(), ystride, uv.data(), cstride)),
-                      expected);
-            // One block, Android style: chroma rows as long as luma rows.
-            Bytes nv21(size_t(w) * h + 2 * cw * ch);
-            std::memcpy(nv21.data(), p.y.data(), p.y.size());
-            for (size_t r = 0; r < ch; ++r) std::memcpy(&nv21[w * h + r * 2 * cw], &vu[r * cstride], 2 * cw);
-            EXPECT_EQ(enc.encode(ImageView(nv21.data(), w, h, PixelFormat::nv21)), expected);
-
+            for (const PixelFormat f : {PixelFormat::nv21, PixelFormat::nv12}) {
+                const Bytes padded = yuv_layout(p, w, h, f, cstride), tight = yuv_layout(p, w, h, f, 2 * cw);
+                EXPECT_EQ(enc.encode(ImageView::semi_planar(f, w, h, y.data(), ystride, &padded[p.y.size()], cstride)),
+                          expected);
+                // One block, Android style: chroma rows as long as luma rows.
+                EXPECT_EQ(enc.encode(ImageView(tight.data(), w, h, f)), expected);
+            }
             if (w % 2 != 0) continue;  // packed 4:2:2 holds whole pixel pairs only
-            Bytes evens = p.y;
-            Bytes yuyv, uyvy;
-            const size_t stride = size_t(w) * 2 + 4;
-            yuyv.assign(stride * h, 0x33);
-            uyvy.assign(stride * h, 0x44);
-            for (int r = 0; r < h; ++r)
-                for (int x = 0; x < w; x += 2) {
-                    const uint8_t y0 = p.y[r * w + x], y1 = p.y[r * w + x + 1];
-                    const uint8_t u = p.u[(r / 2) * cw + x / 2], v = p.v[(r / 2) * cw + x / 2];
-                    const uint8_t g[4] = {y0, u, y1, v}, q[4] = {u, y0, v, y1};
-                    std::memcpy(&yuyv[r * stride + 2 * x], g, 4);
-                    std::memcpy(&uyvy[r * stride + 2 * x], q, 4);
-                }
-            EXPECT_EQ(enc.encode(ImageView(yuyv.data(), w, h, PixelFormat::yuyv, stride)), expected);
-            EXPECT_EQ(enc.encode(ImageView(uyvy.data(), w, h, PixelFormat::uyvy, stride)), expected);
+            for (const PixelFormat f : {PixelFormat::yuyv, PixelFormat::uyvy})
+                EXPECT_EQ(enc.encode(ImageView(yuv_layout(p, w, h, f, 2 * w + 4).data(), w, h, f, 2 * w + 4)), expected);
         }
     }
 }
@@ -236,16 +241,7 @@ TEST(CppApi, FailingSinksStopTheEncode) {
     EXPECT_FALSE(tekoj_test::file_exists(path));
 }
 
-// The segment from the APP1 marker on; empty when there is none.
-Bytes app1_of(const Bytes& jpeg) {
-    for (size_t i = 2; i + 4 <= jpeg.size();) {
-        if (jpeg[i] != 0xFF) break;
-        const size_t len = size_t(jpeg[i + 2]) << 8 | jpeg[i + 3];
-        if (jpeg[i + 1] == 0xE1) return Bytes(jpeg.begin() + i, jpeg.begin() + i + 2 + len);
-        i += 2 + len;
-    }
-    return {};
-}
+Bytes app1_of(const Bytes& jpeg) { return tekoj_test::segment(jpeg, 0xE1); }
 
 bool contains(const Bytes& hay, const std::string& needle) {
     return std::search(hay.begin(), hay.end(), needle.begin(), needle.end()) != hay.end();
@@ -294,23 +290,11 @@ TEST(CppApi, ThumbnailIsMadeByTheLibraryAndFitsTheSegment) {
     for (const Case& c : cases) {
         SCOPED_TRACE(testing::Message() << int(c.format) << " " << c.w << "x" << c.h);
         const Bytes rgb = tekoj_test::photo_rgb(c.w, c.h, 5);
-        Bytes pixels;
-        if (c.format == PixelFormat::rgb888) pixels = rgb;
-        if (c.format == PixelFormat::rgb565) pixels = tekoj_test::rgb_to_format(rgb, c.w, c.h, EKO_FORMAT_RGB565);
-        if (c.format == PixelFormat::grey) pixels = tekoj_test::rgb_to_grey(rgb, c.w, c.h);
-        if (c.format == PixelFormat::nv21 || c.format == PixelFormat::yuyv) {
-            const Planes p = yuv420_planes(c.w, c.h, 5);
-            const int cw = c.w / 2;
-            if (c.format == PixelFormat::nv21) {
-                pixels = p.y;
-                for (size_t i = 0; i < p.u.size(); ++i) pixels.insert(pixels.end(), {p.v[i], p.u[i]});
-            } else {
-                for (int r = 0; r < c.h; ++r)
-                    for (int x = 0; x < cw; ++x)
-                        pixels.insert(pixels.end(), {p.y[r * c.w + 2 * x], p.u[(r / 2) * cw + x],
-                                                     p.y[r * c.w + 2 * x + 1], p.v[(r / 2) * cw + x]});
-            }
-        }
+        Bytes pixels = c.format == PixelFormat::rgb888 ? rgb
+                       : c.format == PixelFormat::rgb565 ? tekoj_test::rgb_to_format(rgb, c.w, c.h, EKO_FORMAT_RGB565)
+                       : c.format == PixelFormat::grey   ? tekoj_test::rgb_to_grey(rgb, c.w, c.h)
+                                                         : yuv_layout(yuv420_planes(c.w, c.h, 5), c.w, c.h, c.format,
+                                                                      c.format == PixelFormat::nv21 ? c.w : 2 * c.w);
         tekoj::Encoder enc;
         enc.thumbnail(c.thumb);
         const Bytes jpeg = enc.encode(ImageView(pixels.data(), c.w, c.h, c.format));

@@ -45,27 +45,11 @@ ImageInfo with_exif(const ExifInfo* exif, const Bytes& rgb48x32) {
     return info;
 }
 
-// What the last stream encode handed over: where each piece was, and its bytes.
-std::vector<std::pair<const uint8_t*, Bytes>> pieces;
-uint32_t collect(void*, const uint8_t* data, uint32_t count) {
-    pieces.emplace_back(data, Bytes(data, data + count));
-    return count;
-}
-
 // One encode to target 0 memory (a block the library allocates), 1 file,
 // 2 stream; empty on failure.
-Bytes encode(const ImageInfo& info, int target) {
-    uint8_t* block = nullptr;
-    int32_t length = 0;
-    Bytes out;
-    pieces.clear();
-    if (target == 0 && eko_enc_jpeg_to_buffer(&info, &block, &length, 75) == 1) out.assign(block, block + length);
-    if (target == 1 && eko_enc_jpeg_to_file(&info, temp_path("exif.jpg").c_str(), 75) == 1)
-        out = read_file(temp_path("exif.jpg"));
-    if (target == 2 && eko_enc_jpeg_to_stream(&info, collect, 75, &pieces) == 1)
-        for (const auto& [at, bytes] : pieces) out.insert(out.end(), bytes.begin(), bytes.end());
-    DORVATEKO_OsFree(block);
-    return out;
+constexpr int kMembersByTarget[3] = {kToBuffer, kToFile, kToStream};
+Call encode(const ImageInfo& info, int target) {
+    return call_member(kMembersByTarget[target], info, 75, temp_path("exif.jpg"));
 }
 
 uint32_t app1_length(const Bytes& jpeg) { return jpeg.size() < 24 ? 0 : (jpeg[22] << 8 | jpeg[23]); }
@@ -93,8 +77,9 @@ TEST(ExifApp1, GoldenCaseAndFullDescriptionOnEveryTargetReadBackByExiftoolAndExi
     const Description golden(false), full(true);
     const uint32_t size = static_cast<uint32_t>(tekoj::exif_block_size(&full.e));
     for (int target : {0, 2, 1}) {  // the file written last stays for the readers
-        EXPECT_TRUE(encode(with_exif(&golden.e, input), target) == expected) << target;
-        const Bytes out = encode(with_exif(&full.e, input), target);
+        EXPECT_TRUE(encode(with_exif(&golden.e, input), target).out == expected) << target;
+        const Call call = encode(with_exif(&full.e, input), target);
+        const Bytes& out = call.out;
         ASSERT_EQ(app1_length(out), 8 + size + full.thumb.size()) << target;
         const size_t at = 30 + ifd_of(out, 1).at(0x0201).value;  // where IFD1 puts the thumbnail
         EXPECT_TRUE(at + full.thumb.size() <= out.size() && std::equal(full.thumb.begin(), full.thumb.end(), &out[at]));
@@ -102,7 +87,7 @@ TEST(ExifApp1, GoldenCaseAndFullDescriptionOnEveryTargetReadBackByExiftoolAndExi
         EXPECT_TRUE(main.ok && !main.warning && main.width == 48 && main.height == 32) << main.message;
         EXPECT_TRUE(thumb.ok && !thumb.warning && thumb.width == 160 && thumb.height == 120) << thumb.message;
         // The stream callback received the caller's own thumbnail, in one piece.
-        EXPECT_EQ(std::count(pieces.begin(), pieces.end(), std::pair{full.thumb.data(), full.thumb}), target == 2);
+        EXPECT_EQ(std::count(call.pieces.begin(), call.pieces.end(), std::pair{full.thumb.data(), full.thumb}), target == 2);
     }
     const std::string path = temp_path("exif.jpg"), length = std::to_string(full.thumb.size());
     const Bytes jpeg = read_file(path);
@@ -152,7 +137,7 @@ TEST(ExifApp1, LongStringsFitAndOversizedOrBrokenDescriptionsAreRefused) {
     e.thumb_length = static_cast<uint32_t>(filler.size()), e.thumb_data = filler.data();
     const ImageInfo info = with_exif(&e, photo);
     for (int target = 0; target < 3; ++target) {
-        const Bytes out = encode(info, target);
+        const Bytes out = encode(info, target).out;
         ASSERT_EQ(app1_length(out), 65535u) << target;
         EXPECT_STREQ(reinterpret_cast<const char*>(tiff_of(out) + ifd_of(out, 0).at(0x010F).value), e.make);
         EXPECT_TRUE(decode_jpeg(out).ok) << target;
@@ -160,8 +145,9 @@ TEST(ExifApp1, LongStringsFitAndOversizedOrBrokenDescriptionsAreRefused) {
     const auto refused = [&](uint32_t code) {
         for (int target = 0; target < 3; ++target) {
             eko_SetError(EKO_OK);
-            EXPECT_TRUE(encode(info, target).empty() && eko_GetLastError() == code) << target << " " << code;
-            for (const auto& [at, bytes] : pieces) EXPECT_FALSE(bytes.size() > 21 && bytes[21] == 0xE1);
+            const Call c = encode(info, target);
+            EXPECT_TRUE(c.out.empty() && eko_GetLastError() == code) << target << " " << code;
+            for (const auto& [at, bytes] : c.pieces) EXPECT_FALSE(bytes.size() > 21 && bytes[21] == 0xE1);
         }
     };
     e.thumb_length += 1;

@@ -4,9 +4,6 @@
 #include <algorithm>
 #include <cstdio>
 #include <cstring>
-#include <span>
-
-#include <jpeglib.h>
 
 namespace tekoj_test {
 
@@ -76,25 +73,6 @@ Bytes encode(const ImageInfo& info, Job job) {
     return ok && out.size() == length ? out : Bytes{};
 }
 
-std::vector<int16_t> coefficients_of(const Bytes& jpeg) {
-    jpeg_error_mgr error{};
-    jpeg_decompress_struct d{.err = jpeg_std_error(&error)};
-    jpeg_create_decompress(&d);
-    jpeg_mem_src(&d, jpeg.data(), jpeg.size());
-    jpeg_read_header(&d, TRUE);
-    jvirt_barray_ptr* planes = jpeg_read_coefficients(&d);
-    std::vector<int16_t> out;
-    for (JDIMENSION y = 0; y < d.MCU_rows_in_scan; ++y)
-        for (JDIMENSION x = 0; x < d.MCUs_per_row; ++x)
-            for (const jpeg_component_info* k : std::span(d.cur_comp_info, d.comps_in_scan)) {
-                const JDIMENSION h = k->MCU_height, w = k->MCU_width;  // blocks of the MCU
-                auto rows = d.mem->access_virt_barray((j_common_ptr)&d, planes[k->component_index], y * h, h, FALSE);
-                for (JDIMENSION r = 0; r < h; ++r) out.insert(out.end(), rows[r][x * w], rows[r][x * w] + 64 * w);
-            }
-    jpeg_destroy_decompress(&d);
-    return out;
-}
-
 std::vector<McuBlockList> block_lists(std::vector<int16_t>& coefficients, uint32_t blocks, uint32_t first,
                                       uint32_t count, uint32_t stride) {
     std::vector<McuBlockList> lists(count);
@@ -102,17 +80,6 @@ std::vector<McuBlockList> block_lists(std::vector<int16_t>& coefficients, uint32
         for (uint32_t b = 0; b < blocks; ++b)
             lists[k].blocks[b] = &coefficients[(static_cast<size_t>(first + k * stride) * blocks + b) * 64];
     return lists;
-}
-
-EncoderSettings settings(uint32_t size_estimate, uint32_t write_dri, uint8_t h, uint8_t v, uint32_t quality) {
-    EncoderSettings s{.num_components = 3, .num_quant_tables = 2, .write_dri = write_dri,
-                      .size_estimate = size_estimate, .component_specs = {{0, h, v}, {1, 1, 1}, {1, 1, 1}}};
-    // The usual tables, scaled as for qualities 50..99.
-    for (int i = 0, scale = 200 - 2 * static_cast<int>(quality); i < 64; ++i) {
-        s.quant_tables[0][i] = uint8_t((eko_luminanceQuantTbl[0][i] * scale + 50) / 100);
-        s.quant_tables[1][i] = uint8_t((eko_chrominanceQuantTbl[0][i] * scale + 50) / 100);
-    }
-    return s;
 }
 
 }  // namespace tekoj_test

@@ -1,5 +1,7 @@
-// Planar readers on real contexts: repeated edges of the last bands, and the
-// interleaved V/U reader filling the same edge cells.
+// Band readers on real contexts: every cell the transform reads beyond the
+// written ones repeats the last written column and row (no stale or
+// uninitialised bytes), for the planar, interleaved V/U and RGB readers. The
+// conversions themselves are pinned by the golden streams.
 #include <TekoJEncoderInternal.h>
 
 #include "support/test_support.h"
@@ -7,35 +9,13 @@
 #include <gtest/gtest.h>
 
 #include <algorithm>
-#include <cstring>
 #include <numeric>
 #include <string>
+#include <utility>
 
 using namespace tekoj_test;
 
 namespace {
-
-// A context whose band rows start as 0xEE so that unwritten cells show.
-struct Planar {
-    EncoderContext* ctx;
-    Planar(const uint8_t* data, int w, int h, uint32_t format) {
-        const ImageInfo info = image_info(data, w, h, format);
-        const OutputRequest out{EKO_OUTPUT_MEMORY, nullptr, static_cast<uint8_t*>(DORVATEKO_OsMalloc(4096)), 4096};
-        const EncodeOptions options{75, nullptr, 0};
-        ctx = __eko_jpeg_enc_initiaize(&info, &out, &options, nullptr);
-        for (int c = 0; c < ctx->num_components; ++c)
-            for (uint32_t r = 0; r < ctx->comp_info[c].band_rows; ++r)
-                std::memset(ctx->sample_rows->row_arrays[c][r], 0xEE, ctx->comp_info[c].padded_width);
-    }
-    ~Planar() {
-        DORVATEKO_OsFree(ctx->output->buffer);
-        __eko_jpeg_enc_release_mem(ctx);
-        DORVATEKO_OsFree(ctx);
-    }
-    Bytes cells(int c, uint32_t r) const {
-        return Bytes(ctx->sample_rows->row_arrays[c][r], ctx->sample_rows->row_arrays[c][r] + ctx->comp_info[c].padded_width);
-    }
-};
 
 // The first `n` values of `source` followed by its last one up to `total`.
 Bytes repeated(const uint8_t* source, size_t n, size_t total) {
@@ -44,31 +24,51 @@ Bytes repeated(const uint8_t* source, size_t n, size_t total) {
     return b;
 }
 
+// Reads every band of the image with `read`, and checks the last band's rows:
+// `cols` and `rows` (per component) were written, the rest repeats them.
+template <typename Read, typename Written>
+void expect_edges_repeated(const ImageInfo& info, Read read, Written written) {
+    Context c(info);
+    ASSERT_NE(c.ctx, nullptr);
+    c.mark_band_rows();
+    for (uint32_t b = 0; b < c->total_imcu_rows; ++b) {
+        if (b > 0) ++c->mcu_state->imcu_row, __eko_jpeg_enc_setup_imcu(c.ctx);
+        read(c.ctx);
+    }
+    for (int comp = 0; comp < c->num_components; ++comp) {
+        const auto [cols, rows] = written(c.ctx, comp);
+        for (uint32_t r = 0; r < c->comp_info[comp].band_rows; ++r)
+            ASSERT_EQ(c.cells(comp, r), repeated(c->sample_rows->row_arrays[comp][std::min(r, rows - 1)], cols,
+                                                 c->comp_info[comp].padded_width)) << comp << " " << r;
+    }
+}
+
 }  // namespace
 
 TEST(PlanarReaders, LastBandsRepeatTheLastColumnAndRow) {
     // Grey 17x1 and 3x13; 4:2:0 of height 20 (second band: 4 luma, 2 chroma
-    // rows) and 5x3.
+    // rows) and 5x3. The written rows must hold the plane's own samples.
     const struct { uint32_t format; int w, h; } cases[] = {
         {EKO_FORMAT_GREY, 17, 1}, {EKO_FORMAT_GREY, 3, 13}, {EKO_FORMAT_YUV420, 17, 20}, {EKO_FORMAT_YUV420, 5, 3}};
     for (const auto& c : cases) {
         SCOPED_TRACE("format " + std::to_string(c.format) + " " + std::to_string(c.w) + "x" + std::to_string(c.h));
         Bytes image(image_size(c.format, c.w, c.h));
         std::iota(image.begin(), image.end(), uint8_t{1});
-        Planar p(image.data(), c.w, c.h, c.format);
-        for (uint32_t b = 0; b < p.ctx->total_imcu_rows; ++b) {
-            if (b > 0) ++p.ctx->mcu_state->imcu_row, __eko_jpeg_enc_setup_imcu(p.ctx);
-            const uint8_t* before[3] = {p.ctx->plane_y, p.ctx->plane_u, p.ctx->plane_v};
-            __eko_jpeg_enc_get_raw_data(p.ctx);
-            for (int comp = 0; comp < p.ctx->num_components; ++comp) {
-                const ComponentInfo& ci = p.ctx->comp_info[comp];
-                for (uint32_t r = 0; r < ci.band_rows; ++r) {
-                    const uint8_t* source = before[comp] + std::min(r, ci.rows_this_band - 1) * ci.downsampled_width;
-                    EXPECT_EQ(p.cells(comp, r), repeated(source, ci.downsampled_width, ci.padded_width))
-                        << b << " " << comp << " " << r;
-                }
-            }
-        }
+        const uint8_t* planes[3] = {};
+        expect_edges_repeated(
+            image_info(image.data(), c.w, c.h, c.format),
+            [&](EncoderContext* ctx) {
+                planes[0] = ctx->plane_y, planes[1] = ctx->plane_u, planes[2] = ctx->plane_v;
+                __eko_jpeg_enc_get_raw_data(ctx);
+            },
+            [&](EncoderContext* ctx, int comp) {
+                const ComponentInfo& ci = ctx->comp_info[comp];
+                for (uint32_t r = 0; r < ci.rows_this_band; ++r)
+                    EXPECT_EQ(Bytes(ctx->sample_rows->row_arrays[comp][r], ctx->sample_rows->row_arrays[comp][r] +
+                                                                               ci.downsampled_width),
+                              Bytes(planes[comp] + r * ci.downsampled_width, planes[comp] + (r + 1) * ci.downsampled_width));
+                return std::pair<uint32_t, uint32_t>{ci.downsampled_width, ci.rows_this_band};
+            });
     }
 }
 
@@ -77,13 +77,37 @@ TEST(PlanarReaders, InterleavedVuReaderFillsTheSameEdgeCells) {
     Bytes y(15);
     std::iota(y.begin(), y.end(), uint8_t{1});
     const Bytes vu = {101, 201, 102, 202, 103, 203, 104, 204, 105, 205, 106, 206};
-    Planar p(y.data(), 5, 3, EKO_FORMAT_YUV420);
-    p.ctx->plane_y = y.data();
-    p.ctx->plane_v = vu.data();
+    Context p(image_info(y.data(), 5, 3, EKO_FORMAT_YUV420));
+    p.mark_band_rows();
+    p->plane_y = y.data();
+    p->plane_v = vu.data();
     EXPECT_EQ(__eko_jpeg_enc_get_raw_pvu_data(p.ctx), 1u);
     for (uint32_t r = 0; r < 16; ++r) EXPECT_EQ(p.cells(0, r), repeated(y.data() + 5 * std::min(r, 2u), 5, 8)) << r;
     const uint8_t cb[2][3] = {{201, 202, 203}, {204, 205, 206}}, cr[2][3] = {{101, 102, 103}, {104, 105, 106}};
     for (int c = 1; c < 3; ++c)  // Cb from the U bytes, Cr from the V bytes
         for (uint32_t r = 0; r < 8; ++r) EXPECT_EQ(p.cells(c, r), repeated((c == 1 ? cb : cr)[r > 0], 3, 8)) << c << r;
-    EXPECT_EQ(p.ctx->plane_v, vu.data() + vu.size());
+    EXPECT_EQ(p->plane_v, vu.data() + vu.size());
+}
+
+TEST(RgbReaders, CellsBeyondTheWrittenOnesRepeatTheLastColumnAndRow) {
+    const std::pair<uint32_t, uint32_t (*)(EncoderContext*)> readers[] = {
+        {EKO_FORMAT_RGB565, __eko_jpeg_enc_get_raw_rgb565_data}, {EKO_FORMAT_RGB888, __eko_jpeg_enc_get_raw_rgb888_data},
+        {EKO_FORMAT_RGBA8888, __eko_jpeg_enc_get_raw_rgba8888_data}, {EKO_FORMAT_BGRA8888, __eko_jpeg_enc_get_raw_bgra8888_data}};
+    for (const auto& reader : readers)
+        for (int w : {1, 2, 5, 17, 32})
+            for (int h : {1, 3, 16, 17, 30}) {
+                const uint32_t f = reader.first;
+                SCOPED_TRACE("format " + std::to_string(f) + " " + std::to_string(w) + "x" + std::to_string(h));
+                const Bytes image = rgb_to_format(photo_rgb(w, h, 3), w, h, f);
+                // RGB565 converts column pairs (a width of 1 pairs with
+                // itself) and doubles an odd last row.
+                expect_edges_repeated(image_info(image.data(), w, h, f), reader.second, [&](EncoderContext* ctx, int c) {
+                    const uint32_t n = ctx->comp_info[0].rows_this_band, pairs = (n + 1) / 2;
+                    const bool averaging = f == EKO_FORMAT_RGB565;
+                    const uint32_t y_cols = averaging ? (w == 1 ? 2 : w & ~1) : w, y_rows = averaging ? 2 * pairs : n;
+                    if (w == 1 && averaging) { EXPECT_EQ(ctx->sample_rows->row_arrays[0][0][0], ctx->sample_rows->row_arrays[0][0][1]); }
+                    return c ? std::pair<uint32_t, uint32_t>{averaging ? y_cols / 2 : (w + 1) / 2, pairs}
+                             : std::pair<uint32_t, uint32_t>{y_cols, y_rows};
+                });
+            }
 }

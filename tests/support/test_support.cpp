@@ -2,12 +2,16 @@
 #include "support/fault_os_layer.h"
 
 #include <turbojpeg.h>
+#include <jpeglib.h>
+
+#include <csetjmp>
 
 #include <gtest/gtest.h>
 
 #include <algorithm>
 #include <cmath>
 #include <cstdio>
+#include <cstring>
 #include <filesystem>
 #include <fstream>
 #include <memory>
@@ -43,6 +47,40 @@ Decoded decode_jpeg(const Bytes& jpeg, bool force_grey) {
     return d;
 }
 
+namespace {
+struct ErrorManager : jpeg_error_mgr {
+    jmp_buf jump;
+};
+}  // namespace
+
+std::vector<int16_t> coefficients_of(const Bytes& jpeg) {
+    jpeg_decompress_struct d;
+    ErrorManager error;
+    d.err = jpeg_std_error(&error);
+    error.error_exit = [](j_common_ptr c) { longjmp(static_cast<ErrorManager*>(c->err)->jump, 1); };
+    std::vector<int16_t> out;
+    if (setjmp(error.jump)) {
+        jpeg_destroy_decompress(&d);
+        return {};
+    }
+    jpeg_create_decompress(&d);
+    jpeg_mem_src(&d, jpeg.data(), jpeg.size());
+    jpeg_read_header(&d, TRUE);
+    jvirt_barray_ptr* planes = jpeg_read_coefficients(&d);
+    for (JDIMENSION y = 0; y < d.MCU_rows_in_scan; ++y)
+        for (JDIMENSION x = 0; x < d.MCUs_per_row; ++x)
+            for (int c = 0; c < d.comps_in_scan; ++c) {
+                const jpeg_component_info* k = d.cur_comp_info[c];
+                const JDIMENSION h = k->MCU_height, w = k->MCU_width;  // blocks of the MCU
+                auto rows = d.mem->access_virt_barray((j_common_ptr)&d, planes[k->component_index], y * h, h, FALSE);
+                for (JDIMENSION r = 0; r < h; ++r) out.insert(out.end(), rows[r][x * w], rows[r][x * w] + 64 * w);
+            }
+    jpeg_finish_decompress(&d);
+    const bool warned = error.num_warnings != 0;
+    jpeg_destroy_decompress(&d);
+    return warned ? std::vector<int16_t>{} : out;
+}
+
 double psnr(const uint8_t* a, const uint8_t* b, size_t count) {
     double se = 0;
     for (size_t i = 0; i < count; ++i) {
@@ -51,6 +89,12 @@ double psnr(const uint8_t* a, const uint8_t* b, size_t count) {
     }
     if (se == 0) return 99.0;
     return 10.0 * std::log10(255.0 * 255.0 * static_cast<double>(count) / se);
+}
+
+Bytes noise(size_t n, uint32_t seed) {
+    Bytes b(n);
+    for (auto& v : b) v = static_cast<uint8_t>((seed = seed * 1664525u + 1013904223u) >> 24);
+    return b;
 }
 
 Bytes noise_with_extremes(size_t n, uint32_t seed) {
@@ -104,44 +148,31 @@ size_t image_size(uint32_t format, int width, int height) {
 
 static uint8_t clamp255(int v) { return static_cast<uint8_t>(v < 0 ? 0 : v > 255 ? 255 : v); }
 
-Bytes rgb_to_yuv420(const Bytes& rgb, int width, int height) {
-    const int cw = (width + 1) / 2, ch = (height + 1) / 2;
-    Bytes out(image_size(EKO_FORMAT_YUV420, width, height));
-    uint8_t* y = out.data();
-    uint8_t* u = y + static_cast<size_t>(width) * height;
-    uint8_t* v = u + static_cast<size_t>(cw) * ch;
-    for (int j = 0; j < height; ++j)
-        for (int i = 0; i < width; ++i) {
-            const uint8_t* p = &rgb[(static_cast<size_t>(j) * width + i) * 3];
-            y[static_cast<size_t>(j) * width + i] = clamp255(static_cast<int>(std::lround(0.299 * p[0] + 0.587 * p[1] + 0.114 * p[2])));
-        }
-    for (int j = 0; j < ch; ++j)
-        for (int i = 0; i < cw; ++i) {
-            double r = 0, g = 0, b = 0;
-            int n = 0;
-            for (int dy = 0; dy < 2; ++dy)
-                for (int dx = 0; dx < 2; ++dx) {
-                    int xx = 2 * i + dx, yy = 2 * j + dy;
-                    if (xx >= width || yy >= height) continue;
-                    const uint8_t* p = &rgb[(static_cast<size_t>(yy) * width + xx) * 3];
-                    r += p[0];
-                    g += p[1];
-                    b += p[2];
-                    ++n;
-                }
-            r /= n;
-            g /= n;
-            b /= n;
-            u[static_cast<size_t>(j) * cw + i] = clamp255(static_cast<int>(std::lround(128 - 0.168736 * r - 0.331264 * g + 0.5 * b)));
-            v[static_cast<size_t>(j) * cw + i] = clamp255(static_cast<int>(std::lround(128 + 0.5 * r - 0.418688 * g - 0.081312 * b)));
-        }
-    return out;
-}
-
 Bytes rgb_to_grey(const Bytes& rgb, int width, int height) {
     Bytes out(static_cast<size_t>(width) * height);
     for (size_t i = 0; i < out.size(); ++i)
         out[i] = clamp255(static_cast<int>(std::lround(0.299 * rgb[3 * i] + 0.587 * rgb[3 * i + 1] + 0.114 * rgb[3 * i + 2])));
+    return out;
+}
+
+// Chroma of each 2x2 block's mean colour (what of the block lies inside).
+Bytes rgb_to_yuv420(const Bytes& rgb, int width, int height) {
+    const int cw = (width + 1) / 2, ch = (height + 1) / 2;
+    Bytes out = rgb_to_grey(rgb, width, height);
+    out.resize(image_size(EKO_FORMAT_YUV420, width, height));
+    uint8_t* u = out.data() + static_cast<size_t>(width) * height;
+    uint8_t* v = u + static_cast<size_t>(cw) * ch;
+    for (int j = 0; j < ch; ++j)
+        for (int i = 0; i < cw; ++i) {
+            double sum[3] = {};
+            int n = 0;
+            for (int y = 2 * j; y < std::min(2 * j + 2, height); ++y)
+                for (int x = 2 * i; x < std::min(2 * i + 2, width); ++x, ++n)
+                    for (int k = 0; k < 3; ++k) sum[k] += rgb[(static_cast<size_t>(y) * width + x) * 3 + k];
+            const double r = sum[0] / n, g = sum[1] / n, b = sum[2] / n;
+            u[static_cast<size_t>(j) * cw + i] = clamp255(static_cast<int>(std::lround(128 - 0.168736 * r - 0.331264 * g + 0.5 * b)));
+            v[static_cast<size_t>(j) * cw + i] = clamp255(static_cast<int>(std::lround(128 + 0.5 * r - 0.418688 * g - 0.081312 * b)));
+        }
     return out;
 }
 
@@ -197,6 +228,93 @@ Bytes encode_to_memory(const ImageInfo& info, uint32_t quality) {
     return out;
 }
 
+EncoderSettings settings(uint32_t size_estimate, uint32_t write_dri, uint8_t h, uint8_t v, uint32_t quality) {
+    EncoderSettings s{};
+    s.num_components = 3, s.num_quant_tables = 2, s.write_dri = write_dri, s.size_estimate = size_estimate;
+    const uint8_t specs[3][3] = {{0, h, v}, {1, 1, 1}, {1, 1, 1}};
+    std::memcpy(s.component_specs, specs, sizeof specs);
+    // The usual tables, scaled as for qualities 50..99.
+    for (int i = 0, scale = 200 - 2 * static_cast<int>(quality); i < 64; ++i) {
+        s.quant_tables[0][i] = uint8_t((eko_luminanceQuantTbl[0][i] * scale + 50) / 100);
+        s.quant_tables[1][i] = uint8_t((eko_chrominanceQuantTbl[0][i] * scale + 50) / 100);
+    }
+    return s;
+}
+
+Context::Context(const ImageInfo& info, const EncoderSettings* settings, uint32_t quality) {
+    const OutputRequest request{EKO_OUTPUT_MEMORY, nullptr, static_cast<uint8_t*>(DORVATEKO_OsMalloc(2048)), 2048};
+    const EncodeOptions options{quality, nullptr, 0};
+    ctx = __eko_jpeg_enc_initiaize(&info, &request, &options, settings);
+    if (ctx == nullptr) DORVATEKO_OsFree(request.buffer);  // refused: still ours
+}
+
+Context::~Context() {
+    if (ctx != nullptr) release(ctx);
+}
+
+void Context::mark_band_rows() {
+    for (int c = 0; c < ctx->num_components; ++c)
+        for (uint32_t r = 0; r < ctx->comp_info[c].band_rows; ++r)
+            std::memset(ctx->sample_rows->row_arrays[c][r], 0xEE, ctx->comp_info[c].padded_width);
+}
+
+Bytes Context::cells(int component, uint32_t row) const {
+    const uint8_t* r = ctx->sample_rows->row_arrays[component][row];
+    return Bytes(r, r + ctx->comp_info[component].padded_width);
+}
+
+Bytes Context::written(size_t from) const {
+    return Bytes(ctx->output->buffer + from, ctx->output->buffer + ctx->output->used);
+}
+
+void release(EncoderContext* ctx) {
+    DORVATEKO_OsFree(ctx->output->buffer);
+    __eko_jpeg_enc_release_mem(ctx);
+    DORVATEKO_OsFree(ctx);
+}
+
+Bytes encode_in_steps(const ImageInfo& info, const EncoderSettings* settings, uint32_t quality) {
+    Context c(info, settings, quality);
+    if (c.ctx == nullptr) return {};
+    EXPECT_EQ(__eko_jpeg_enc_make_header(c.ctx), 1u);
+    for (; c->next_row < uint32_t(c->height); c->next_row = uint16_t(c->next_row + c->max_v_samp * 8))
+        EXPECT_EQ(__eko_jpeg_enc_process_image_data(c.ctx), 1u);
+    EXPECT_EQ(__eko_jpeg_enc_make_end_mark(c.ctx), 1u);
+    return Bytes(c->output->buffer, c->output->buffer + c->output->total);
+}
+
+std::vector<Bytes> header_segments(const Bytes& j) {
+    std::vector<Bytes> out{Bytes(j.begin(), j.begin() + std::min<long>(2, long(j.size())))};
+    for (size_t i = 2; i + 4 <= j.size() && j[i] == 0xFF;) {
+        const size_t len = size_t(j[i + 2]) << 8 | j[i + 3];
+        out.emplace_back(j.begin() + long(i), j.begin() + long(std::min(i + 2 + len, j.size())));
+        if (j[i + 1] == 0xDA) break;
+        i += 2 + len;
+    }
+    return out;
+}
+
+Bytes segment(const Bytes& jpeg, uint8_t code) {
+    for (Bytes& s : header_segments(jpeg))
+        if (s.size() >= 2 && s[1] == code) return s;
+    return {};
+}
+
+size_t find_marker(const Bytes& j, uint8_t code) {
+    const uint8_t marker[2] = {0xFF, code};
+    return size_t(std::search(j.begin(), j.end(), marker, marker + 2) - j.begin());
+}
+
+size_t open_descriptors() {
+    using std::filesystem::directory_iterator;
+    return size_t(std::distance(directory_iterator("/proc/self/fd"), directory_iterator{}));
+}
+
+NoLeak::~NoLeak() {
+    EXPECT_EQ(live_blocks(), live);
+    EXPECT_EQ(open_descriptors(), fds);
+}
+
 std::string member_name(int m) {
     static const char* const names[kMembers] = {
         "to_file", "to_file_ex", "to_file_full_buffer", "to_file_ex_full_buffer", "to_buffer", "to_buffer_ex",
@@ -219,6 +337,7 @@ Call call_member(int m, const ImageInfo& info, uint32_t quality, const std::stri
         auto* to = static_cast<Call*>(arg);
         to->out.insert(to->out.end(), data, data + n);
         to->largest_piece = std::max(to->largest_piece, n);
+        to->pieces.emplace_back(data, Bytes(data, data + n));
         return 0;
     };
     if (fail_at >= 0) fail_allocation(fail_at);
@@ -243,7 +362,7 @@ Call call_member(int m, const ImageInfo& info, uint32_t quality, const std::stri
         const bool enlarged = m == kToBuffer && start < 2048 && buffer != nullptr && length == 2048;
         if (c.result == 0) { EXPECT_TRUE(c.kept || enlarged || (buffer == nullptr && length == 0)) << member_name(m); }
         DORVATEKO_OsFree(buffer);
-    } else if (is_file_member(m)) {
+    } else if (m <= kToFileExFull) {
         c.out.clear();
         if (c.result == 1 && std::filesystem::is_regular_file(path)) c.out = read_file(path);
     } else if (c.result == 0) {
