@@ -330,7 +330,7 @@ int rss_only(const Image& img, uint32_t threads, int stack) {
 
 // Coding time of each MCU row (one worker, to memory), their spread, and the
 // speedup that P workers taking rows in order can reach when a row may run
-// at most a window of 2P or 8P rows ahead of the first row not yet handed
+// at most a window of 2P or 16P rows ahead of the first row not yet handed
 // on: with the cores to themselves, and sharing them with other processes.
 int row_times(const Image& img) {
     ImageInfo info{};
@@ -392,7 +392,7 @@ int row_times(const Image& img) {
         return total / trials;
     };
     for (uint32_t p : {2u, 4u, 8u})
-        for (uint32_t depth : {2u, 8u})
+        for (uint32_t depth : {2u, 16u})
             std::printf("  %u workers, window %2u: speedup %.2f (ideal %.2f); sharing cores, 3 ms of 6: %.2f\n", p,
                         p * depth, simulate(p, p * depth, 1, 0), std::min<double>(p, sum / sorted[n - 1]),
                         simulate(p, p * depth, 3e-3, 3e-3));

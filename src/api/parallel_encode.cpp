@@ -34,7 +34,7 @@ namespace {
 constexpr uint32_t kMaxWorkers = 64;
 // Row buffer capacity a window aims to stay within (at least two buffers
 // per worker whatever the width).
-constexpr uint64_t kWindowCapacity = 2u << 20;
+constexpr uint64_t kWindowCapacity = 4u << 20;
 
 struct RowBuffer {
     OutputTarget target;  // kind memory: the coded row
@@ -188,11 +188,11 @@ bool prepare(Encode* e) {
     // The window is what lets a worker run on past a row that another is
     // still coding: a slow row, or one whose thread lost its core for a
     // time slice, which on a loaded device is worth dozens of rows. Up to
-    // eight rows per worker, within kWindowCapacity of row buffers in all
+    // 16 rows per worker, within kWindowCapacity of row buffers in all
     // (their capacity is a pessimistic guess; a row touches a fraction).
     const uint64_t row_guess = uint64_t{main->mcus_per_row} * main->blocks_in_mcu * 48u + 64u;
     const uint64_t fit = kWindowCapacity / (row_guess * e->workers);
-    const uint32_t depth = static_cast<uint32_t>(std::clamp<uint64_t>(fit, 2, 8));
+    const uint32_t depth = static_cast<uint32_t>(std::clamp<uint64_t>(fit, 2, 16));
     e->window = e->workers * depth < e->rows ? e->workers * depth : e->rows;
     if ((e->worker = allocate_zeroed<Worker>(e->workers)) == nullptr) return false;
     if ((e->buffer = allocate_zeroed<RowBuffer>(e->window)) == nullptr) return false;
