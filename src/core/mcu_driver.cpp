@@ -74,12 +74,18 @@ bool compress_band(EncoderContext* ctx, uint8_t** const* row_arrays) {
                     }
                 }
             }
+            // The first MCU's blocks, and how far each block steps per MCU.
+            int16_t* mcu[10];
+            uint32_t step[10];
+            uint32_t blocks = 0;
+            for (uint32_t s = 0; s < k; ++s)
+                for (uint32_t h = 0; h < width[s]; ++h, ++blocks) {
+                    mcu[blocks] = strip[s] + 64 * h;
+                    step[blocks] = 64 * width[s];
+                }
             for (uint32_t i = 0; i < n; ++i) {
-                int16_t* mcu[10];
-                uint32_t blkn = 0;
-                for (uint32_t s = 0; s < k; ++s)
-                    for (uint32_t h = 0; h < width[s]; ++h) mcu[blkn++] = strip[s] + 64 * (i * width[s] + h);
                 if (!code_mcu(coder, *ctx->coder_tables, mcu)) return false;
+                for (uint32_t b = 0; b < blocks; ++b) mcu[b] += step[b];
             }
             x0 += n;
         }
