@@ -5,6 +5,7 @@
 #include "core/entropy_coder.h"
 #include "core/forward_dct.h"
 #include "input/formats.h"
+#include "input/readers.h"
 #include "core/band_driver.h"
 
 #include <cstring>
@@ -99,9 +100,11 @@ bool compress_band(EncoderContext* ctx, uint8_t** const* row_arrays) {
 
 bool process_band(EncoderContext* ctx) {
     if (ctx->failed != 0) return false;
-    format_traits(ctx->format)->read(ctx);
     SampleRowSet* rows = ctx->sample_rows;
-    const bool ok = compress_band(ctx, rows->row_arrays);
+    uint8_t** arrays[3] = {rows->row_arrays[0], rows->row_arrays[1], rows->row_arrays[2]};
+    InPlaceRows in_place;
+    if (!read_planar_in_place(ctx, in_place, arrays)) format_traits(ctx->format)->read(ctx);
+    const bool ok = compress_band(ctx, arrays);
     ++rows->band_counter;
     rows->band_flag = 0;
     return ok;
