@@ -210,6 +210,7 @@ template <bool kInRange>
     }
     const char* base = reinterpret_cast<const char*>(values);
     const uint32_t* ac_top = ac + 32;  // ac_top[16 * run - z]: the entry of category 32 - z
+    const uint32_t* value_codes = kValueCodes.entry + 1023;  // indexed by the value
     auto code = [&](Count run, const uint8_t* at) __attribute__((always_inline)) {
         while (run > 15) [[unlikely]] {
             put(w, ac[0xF0] >> 5, static_cast<int>(ac[0xF0] & 31));
@@ -219,7 +220,7 @@ template <bool kInRange>
         std::memcpy(&v, base + *at, sizeof v);
         if constexpr (kInRange) {
             // Category and extra bits by table lookup.
-            const uint32_t value_code = kValueCodes.entry[v + 1023];
+            const uint32_t value_code = value_codes[static_cast<Count>(v)];
             const uint32_t entry = ac[run * 16 + static_cast<Count>(value_code & 0xFF)];
             put(w, (entry >> 5) | (value_code >> 8), static_cast<int>(entry & 31));
         } else {
