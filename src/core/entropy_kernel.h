@@ -61,15 +61,34 @@ inline void write_byte(uint8_t*& out, uint32_t b) {
 // Appends the low `size` bits of `code` (nothing above them set); size is at
 // most 26.
 [[gnu::always_inline]] inline void put(BitState& w, uint32_t code, int size) {
-    w.free -= size;
-    if (__builtin_expect(w.free >= 0, 1)) {
+    if constexpr (sizeof(BitAcc) == 8) {
+        // A 64-bit word keeps at least 26 bits free before each code, so the
+        // code always fits, and writes its oldest 32 bits once fewer are
+        // free: the common path has no carry-over between words.
         w.acc = (w.acc << size) | code;
+        w.free -= size;
+        if (__builtin_expect(w.free < 26, 0)) {
+            const uint32_t word = static_cast<uint32_t>(w.acc >> (32 - w.free));
+            if (!has_ff_byte(word)) [[likely]] {
+                const uint32_t be = __builtin_bswap32(word);
+                std::memcpy(w.out, &be, sizeof be);
+                w.out += sizeof be;
+            } else {
+                for (int s = 24; s >= 0; s -= 8) write_byte(w.out, (word >> s) & 0xFF);
+            }
+            w.free += 32;
+        }
     } else {
-        // Fill the word, write it, keep the rest of the code.
-        w.acc = (w.acc << (size + w.free)) | (code >> -w.free);
-        flush_word(w);
-        w.acc = code;
-        w.free += kAccBits;
+        w.free -= size;
+        if (__builtin_expect(w.free >= 0, 1)) {
+            w.acc = (w.acc << size) | code;
+        } else {
+            // Fill the word, write it, keep the rest of the code.
+            w.acc = (w.acc << (size + w.free)) | (code >> -w.free);
+            flush_word(w);
+            w.acc = code;
+            w.free += kAccBits;
+        }
     }
 }
 
@@ -210,6 +229,7 @@ template <bool kInRange>
     }
     const char* base = reinterpret_cast<const char*>(values);
     const uint32_t* ac_top = ac + 32;  // ac_top[16 * run - z]: the entry of category 32 - z
+    const uint32_t* value_codes = kValueCodes.entry + 1023;  // indexed by the value
     auto code = [&](Count run, const uint8_t* at) __attribute__((always_inline)) {
         while (run > 15) [[unlikely]] {
             put(w, ac[0xF0] >> 5, static_cast<int>(ac[0xF0] & 31));
@@ -219,7 +239,7 @@ template <bool kInRange>
         std::memcpy(&v, base + *at, sizeof v);
         if constexpr (kInRange) {
             // Category and extra bits by table lookup.
-            const uint32_t value_code = kValueCodes.entry[v + 1023];
+            const uint32_t value_code = value_codes[static_cast<Count>(v)];
             const uint32_t entry = ac[run * 16 + static_cast<Count>(value_code & 0xFF)];
             put(w, (entry >> 5) | (value_code >> 8), static_cast<int>(entry & 31));
         } else {

@@ -62,7 +62,8 @@ inline uint8x8_t cr_bytes(const Bytes3& c) {
     return finish(h, l);
 }
 
-// Sixteen pixels' channels.
+// Sixteen pixels' channels. The row loops below step their pointers on
+// rather than index from the row start: no index arithmetic per step.
 struct Pixels16 {
     uint8x16_t r, g, b;
 };
@@ -91,22 +92,20 @@ inline Bytes3 even8(const Pixels16& p) {
 
 template <int Bpp, bool Bgr, PickLayout Layout>
 void pick_upper(const uint8_t* src, uint32_t w, uint8_t* y, uint8_t* cb, uint8_t* cr) {
-    uint32_t x = 0;
-    for (; x + 16 <= w; x += 16) {
-        const Pixels16 px = load16<Bpp, Bgr>(src + static_cast<size_t>(x) * Bpp);
-        vst1q_u8(y + x, luma16(px));
+    for (uint32_t n = w / 16; n > 0; --n, src += 16 * Bpp, y += 16, cb += 8, cr += 8) {
+        const Pixels16 px = load16<Bpp, Bgr>(src);
+        vst1q_u8(y, luma16(px));
         const Bytes3 even = even8(px);
-        vst1_u8(cb + x / 2, cb_bytes(even));
-        vst1_u8(cr + x / 2, cr_bytes(even));
+        vst1_u8(cb, cb_bytes(even));
+        vst1_u8(cr, cr_bytes(even));
     }
-    kPortableInputKernels.pick_upper[Layout](src + static_cast<size_t>(x) * Bpp, w - x, y + x, cb + x / 2, cr + x / 2);
+    kPortableInputKernels.pick_upper[Layout](src, w % 16, y, cb, cr);
 }
 
 template <int Bpp, bool Bgr, PickLayout Layout>
 void pick_lower(const uint8_t* src, uint32_t w, uint8_t* y) {
-    uint32_t x = 0;
-    for (; x + 16 <= w; x += 16) vst1q_u8(y + x, luma16(load16<Bpp, Bgr>(src + static_cast<size_t>(x) * Bpp)));
-    kPortableInputKernels.pick_lower[Layout](src + static_cast<size_t>(x) * Bpp, w - x, y + x);
+    for (uint32_t n = w / 16; n > 0; --n, src += 16 * Bpp, y += 16) vst1q_u8(y, luma16(load16<Bpp, Bgr>(src)));
+    kPortableInputKernels.pick_lower[Layout](src, w % 16, y);
 }
 
 // Each 5- or 6-bit field moves to the top of a byte plus half a step
@@ -124,23 +123,21 @@ inline uint16x8_t sum4(uint8x8_t a, uint8x8_t b, uint8x8_t c, uint8x8_t d) {
 
 void rgb565_blocks(const uint8_t* upper, const uint8_t* lower, uint32_t blocks, uint8_t* y0, uint8_t* y1, uint8_t* cb,
                    uint8_t* cr) {
-    uint32_t k = 0;
-    for (; k + 8 <= blocks; k += 8) {
+    for (uint32_t n = blocks / 8; n > 0; --n, upper += 32, lower += 32, y0 += 16, y1 += 16, cb += 8, cr += 8) {
         // Even and odd pixels of 16-pixel runs of both rows.
-        const uint16x8x2_t u = vld2q_u16(reinterpret_cast<const uint16_t*>(upper + 4 * k));
-        const uint16x8x2_t l = vld2q_u16(reinterpret_cast<const uint16_t*>(lower + 4 * k));
+        const uint16x8x2_t u = vld2q_u16(reinterpret_cast<const uint16_t*>(upper));
+        const uint16x8x2_t l = vld2q_u16(reinterpret_cast<const uint16_t*>(lower));
         const Bytes3 ue = expand565(u.val[0]), uo = expand565(u.val[1]);
         const Bytes3 le = expand565(l.val[0]), lo = expand565(l.val[1]);
-        vst2_u8(y0 + 2 * k, (uint8x8x2_t{{luma_bytes(ue), luma_bytes(uo)}}));
-        vst2_u8(y1 + 2 * k, (uint8x8x2_t{{luma_bytes(le), luma_bytes(lo)}}));
+        vst2_u8(y0, (uint8x8x2_t{{luma_bytes(ue), luma_bytes(uo)}}));
+        vst2_u8(y1, (uint8x8x2_t{{luma_bytes(le), luma_bytes(lo)}}));
         // Green alone gets the rounding term of the average: a rounding shift.
         const Bytes3 avg{vshrn_n_u16(sum4(ue.r, uo.r, le.r, lo.r), 2), vrshrn_n_u16(sum4(ue.g, uo.g, le.g, lo.g), 2),
                          vshrn_n_u16(sum4(ue.b, uo.b, le.b, lo.b), 2)};
-        vst1_u8(cb + k, cb_bytes(avg));
-        vst1_u8(cr + k, cr_bytes(avg));
+        vst1_u8(cb, cb_bytes(avg));
+        vst1_u8(cr, cr_bytes(avg));
     }
-    kPortableInputKernels.rgb565_blocks(upper + 4 * k, lower + 4 * k, blocks - k, y0 + 2 * k, y1 + 2 * k, cb + k,
-                                        cr + k);
+    kPortableInputKernels.rgb565_blocks(upper, lower, blocks % 8, y0, y1, cb, cr);
 }
 
 // Packed 4:2:2: sixteen groups per step, split into Y0, U, Y1 and V by one
