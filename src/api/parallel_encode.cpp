@@ -25,12 +25,16 @@
 
 #include <condition_variable>
 #include <mutex>
+#include <algorithm>
 #include <new>
 
 namespace tekoj {
 namespace {
 
 constexpr uint32_t kMaxWorkers = 64;
+// Row buffer capacity a window aims to stay within (at least two buffers
+// per worker whatever the width).
+constexpr uint64_t kWindowCapacity = 4u << 20;
 
 struct RowBuffer {
     OutputTarget target;  // kind memory: the coded row
@@ -63,6 +67,7 @@ struct EkoParallelEncode {
     bool serial_busy = false;
     bool handing = false;  // a worker is handing rows on
     uint32_t failed = 0;   // first error code of any worker or of the output
+    uint64_t row_bytes = 0;  // coded bytes handed on so far (by the worker handing on)
 };
 
 namespace tekoj {
@@ -180,16 +185,20 @@ bool prepare(Encode* e) {
     const EncoderContext* main = e->main;
     // Serial mode codes on the main context; its workers only take turns.
     if (e->serial) return (e->worker = allocate_zeroed<Worker>(e->workers)) != nullptr;
-    // Two buffers per worker keep every worker busy while a slow row holds
-    // the hand-on back; short rows get a deeper window for the same memory.
-    const uint32_t row_guess = main->mcus_per_row * main->blocks_in_mcu * 48u + 64u;
-    const uint32_t depth = row_guess < 16384 ? 4 : 2;
+    // The window is what lets a worker run on past a row that another is
+    // still coding: a slow row, or one whose thread lost its core for a
+    // time slice, which on a loaded device is worth dozens of rows. Up to
+    // 16 rows per worker, within kWindowCapacity of row buffers in all
+    // (their capacity is a pessimistic guess; a row touches a fraction).
+    const uint64_t row_guess = uint64_t{main->mcus_per_row} * main->blocks_in_mcu * 48u + 64u;
+    const uint64_t fit = kWindowCapacity / (row_guess * e->workers);
+    const uint32_t depth = static_cast<uint32_t>(std::clamp<uint64_t>(fit, 2, 16));
     e->window = e->workers * depth < e->rows ? e->workers * depth : e->rows;
     if ((e->worker = allocate_zeroed<Worker>(e->workers)) == nullptr) return false;
     if ((e->buffer = allocate_zeroed<RowBuffer>(e->window)) == nullptr) return false;
     for (uint32_t i = 0; i < e->workers; ++i)
         if ((e->worker[i].ctx = make_worker(main)) == nullptr) return false;
-    const uint32_t capacity = row_guess < 4096 ? 4096 : row_guess;
+    const uint32_t capacity = static_cast<uint32_t>(std::max<uint64_t>(row_guess, 4096));
     for (uint32_t i = 0; i < e->window; ++i) {
         OutputTarget& t = e->buffer[i].target;
         t.kind = EKO_OUTPUT_MEMORY;
@@ -233,12 +242,33 @@ bool code_row(const Encode* e, EncoderContext* w, OutputTarget* out, uint32_t ro
     return w->failed == 0;
 }
 
-// Passes a coded row to the main target the way its kind passes long runs:
-// appended to a memory block, handed to the file in one piece, to the
+// Passes coded row `row` to the main target the way its kind passes long
+// runs: appended to a memory block, handed to the file in one piece, to the
 // callback in pieces of at most 4096 bytes.
-bool hand_on_row(EncoderContext* main, const OutputTarget& row) {
+//
+// A memory block that lacks room grows at once to the stream so far plus
+// the rows still to come at the mean size of the rows handed on, and an
+// eighth more: a few growths in all rather than one every half again, so
+// the join copies hardly a byte twice and the worker handing rows on is
+// rarely held up by a long copy while the others wait for the window. The
+// growth is at least half again (flat rows first make a poor estimate) and
+// at most fourfold, so an early dense row cannot claim a block far beyond
+// the stream.
+bool hand_on_row(Encode* e, uint32_t row, const OutputTarget& coded) {
+    EncoderContext* main = e->main;
     const Sink sink = sink_of(main);
-    return kind_of(sink.target).write_run(sink, row.buffer, row.used) && main->failed == 0;
+    const SinkKind& kind = kind_of(sink.target);
+    OutputTarget* t = sink.target;
+    if (t->kind == EKO_OUTPUT_MEMORY && t->capacity - t->used < coded.used) {
+        const uint64_t mean = (e->row_bytes + coded.used) / (row + 1);
+        const uint64_t later = e->rows - row - 1;
+        const uint64_t ahead = later * mean + (later * mean + 64) / 8;
+        const uint64_t now = static_cast<uint64_t>(t->used) + coded.used;
+        const uint64_t room = coded.used + std::clamp(ahead, now / 2, 3 * now);
+        if (!kind.reserve(sink, std::min<uint64_t>(room, kMaxMemoryStream - t->used))) return false;
+    }
+    e->row_bytes += coded.used;
+    return kind.write_run(sink, coded.buffer, coded.used) && main->failed == 0;
 }
 
 // Serial mode: the rows are one restart interval (or none), so each is coded
@@ -289,8 +319,9 @@ bool parallel_row(Encode* e, Guard& g, EncoderContext* w, uint32_t row) {
     while (e->failed == 0 && e->handed < e->rows) {
         RowBuffer& next = e->buffer[e->handed % e->window];
         if (!next.done || next.row != e->handed) break;
+        const uint32_t first = e->handed;
         g.unlock();
-        const bool written = hand_on_row(e->main, next.target);
+        const bool written = hand_on_row(e, first, next.target);
         g.lock();
         if (!written) {
             fail_locked(e, e->main->failed);

@@ -61,15 +61,34 @@ inline void write_byte(uint8_t*& out, uint32_t b) {
 // Appends the low `size` bits of `code` (nothing above them set); size is at
 // most 26.
 [[gnu::always_inline]] inline void put(BitState& w, uint32_t code, int size) {
-    w.free -= size;
-    if (__builtin_expect(w.free >= 0, 1)) {
+    if constexpr (sizeof(BitAcc) == 8) {
+        // A 64-bit word keeps at least 26 bits free before each code, so the
+        // code always fits, and writes its oldest 32 bits once fewer are
+        // free: the common path has no carry-over between words.
         w.acc = (w.acc << size) | code;
+        w.free -= size;
+        if (__builtin_expect(w.free < 26, 0)) {
+            const uint32_t word = static_cast<uint32_t>(w.acc >> (32 - w.free));
+            if (!has_ff_byte(word)) [[likely]] {
+                const uint32_t be = __builtin_bswap32(word);
+                std::memcpy(w.out, &be, sizeof be);
+                w.out += sizeof be;
+            } else {
+                for (int s = 24; s >= 0; s -= 8) write_byte(w.out, (word >> s) & 0xFF);
+            }
+            w.free += 32;
+        }
     } else {
-        // Fill the word, write it, keep the rest of the code.
-        w.acc = (w.acc << (size + w.free)) | (code >> -w.free);
-        flush_word(w);
-        w.acc = code;
-        w.free += kAccBits;
+        w.free -= size;
+        if (__builtin_expect(w.free >= 0, 1)) {
+            w.acc = (w.acc << size) | code;
+        } else {
+            // Fill the word, write it, keep the rest of the code.
+            w.acc = (w.acc << (size + w.free)) | (code >> -w.free);
+            flush_word(w);
+            w.acc = code;
+            w.free += kAccBits;
+        }
     }
 }
 
@@ -150,10 +169,6 @@ inline ScanMap scan_map_from_bits(uint64_t bits) {
     return (m >> r) >> 1;
 }
 
-// A biased value beyond +-1023 as +-1023 (category 10) is biased; out of
-// line, so that the coding loop keeps the sign only where it needs it.
-[[gnu::noinline]] inline uint32_t limited(uint32_t t) { return 0x3FFu ^ static_cast<uint32_t>(static_cast<int32_t>(t) >> 31); }
-
 // Byte offsets of the coefficient at each zig-zag position in a block in
 // natural order, and in one already in zig-zag order.
 struct ScanOffsets {
@@ -172,12 +187,35 @@ constexpr ScanOffsets make_scan_offsets() {
 
 inline constexpr ScanOffsets kScanOffsets = make_scan_offsets();
 
+// Category and extra bits of every AC value the baseline tables can code:
+// entry x + 1023 holds the category in its low byte and the extra bits above.
+struct ValueCodes {
+    uint32_t entry[2047];
+};
+
+constexpr ValueCodes make_value_codes() {
+    ValueCodes t{};
+    for (int x = -1023; x <= 1023; ++x) {
+        int k = 0;
+        for (int a = x < 0 ? -x : x; a != 0; a >>= 1) ++k;
+        const uint32_t extra = static_cast<uint32_t>(x < 0 ? x - 1 : x) & ((1u << k) - 1);
+        t.entry[x + 1023] = static_cast<uint32_t>(k) | extra << 8;
+    }
+    return t;
+}
+
+inline constexpr ValueCodes kValueCodes = make_value_codes();
+
+// A biased value beyond +-1023 as +-1023 (category 10) is biased; out of
+// line, so that the coding loop keeps the sign only where it needs it.
+[[gnu::noinline]] inline uint32_t limited(uint32_t t) { return 0x3FFu ^ static_cast<uint32_t>(static_cast<int32_t>(t) >> 31); }
+
 // Codes a block: the DC difference, then the AC positions set in `map`
 // (positions 1..62 at most), limited to +-1023, then EOB. The value at
-// position p is the int16 at byte offset offsets[p] of `values`; with
-// kBiased, it is stored already as x + (x >> 31) (saturated), from which
-// category and extra bits come with the fewest steps.
-template <bool kBiased>
+// position p is the int16 at byte offset offsets[p] of `values`. With
+// kInRange the caller has made sure that every AC value lies within
+// +-1023, and category and extra bits come from one table lookup.
+template <bool kInRange>
 [[gnu::always_inline]] inline void code_block_from_map(BitState& state, int32_t dc_diff, const uint32_t* dc,
                                                       const uint32_t* ac, const ScanMap& map, const int16_t* values,
                                                       const uint8_t* offsets) {
@@ -189,10 +227,9 @@ template <bool kBiased>
         const int k = category(dc_diff);
         put_coded(w, dc[k], dc_diff, k);
     }
-    // AC table entries are looked up as ac_top[16 * run - leading zeros of
-    // the magnitude], the category being 32 less those zeros.
-    const uint32_t* ac_top = ac + 32;
     const char* base = reinterpret_cast<const char*>(values);
+    const uint32_t* ac_top = ac + 32;  // ac_top[16 * run - z]: the entry of category 32 - z
+    const uint32_t* value_codes = kValueCodes.entry + 1023;  // indexed by the value
     auto code = [&](Count run, const uint8_t* at) __attribute__((always_inline)) {
         while (run > 15) [[unlikely]] {
             put(w, ac[0xF0] >> 5, static_cast<int>(ac[0xF0] & 31));
@@ -200,17 +237,26 @@ template <bool kBiased>
         }
         int16_t v;
         std::memcpy(&v, base + *at, sizeof v);
-        // t: the value, less one when negative (its low bits are the extra
-        // bits); t ^ sign is the magnitude.
-        const int32_t ts = kBiased ? v : v + (v >> 31);
-        uint32_t t = static_cast<uint32_t>(ts);
-        Count z = __builtin_clz(t ^ static_cast<uint32_t>(ts >> 31));  // 32 - category; the value is not 0
-        if (__builtin_expect(z < 22, 0)) {
-            t = limited(t);
-            z = 22;
+        if constexpr (kInRange) {
+            // Category and extra bits by table lookup.
+            const uint32_t value_code = value_codes[static_cast<Count>(v)];
+            const uint32_t entry = ac[run * 16 + static_cast<Count>(value_code & 0xFF)];
+            put(w, (entry >> 5) | (value_code >> 8), static_cast<int>(entry & 31));
+        } else {
+            // Computed, which on 32-bit ARM takes fewer steps than the lookup
+            // and its range check: t is the value, less one when negative
+            // (its low bits are the extra bits), t ^ sign the magnitude.
+            const int32_t ts = v + (v >> 31);
+            uint32_t t = static_cast<uint32_t>(ts);
+            Count z = __builtin_clz(t ^ static_cast<uint32_t>(ts >> 31));  // 32 - category; the value is not 0
+            if (__builtin_expect(z < 22, 0)) {
+                t = limited(t);
+                z = 22;
+            }
+            // The entry of category 32 - z.
+            const uint32_t entry = ac_top[run * 16 - z];
+            put(w, (entry >> 5) | ((t << z) >> z), static_cast<int>(entry & 31));
         }
-        const uint32_t entry = ac_top[run * 16 - z];
-        put(w, (entry >> 5) | ((t << z) >> z), static_cast<int>(entry & 31));
     };
     // `carry`: zeros since the last coded position that belong to the next
     // run (the DC position counts as coded, hence -1 before position 0).

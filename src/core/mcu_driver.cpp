@@ -5,6 +5,7 @@
 #include "core/entropy_coder.h"
 #include "core/forward_dct.h"
 #include "input/formats.h"
+#include "input/readers.h"
 #include "core/band_driver.h"
 
 #include <cstring>
@@ -74,12 +75,18 @@ bool compress_band(EncoderContext* ctx, uint8_t** const* row_arrays) {
                     }
                 }
             }
+            // The first MCU's blocks, and how far each block steps per MCU.
+            int16_t* mcu[10];
+            uint32_t step[10];
+            uint32_t blocks = 0;
+            for (uint32_t s = 0; s < k; ++s)
+                for (uint32_t h = 0; h < width[s]; ++h, ++blocks) {
+                    mcu[blocks] = strip[s] + 64 * h;
+                    step[blocks] = 64 * width[s];
+                }
             for (uint32_t i = 0; i < n; ++i) {
-                int16_t* mcu[10];
-                uint32_t blkn = 0;
-                for (uint32_t s = 0; s < k; ++s)
-                    for (uint32_t h = 0; h < width[s]; ++h) mcu[blkn++] = strip[s] + 64 * (i * width[s] + h);
                 if (!code_mcu(coder, *ctx->coder_tables, mcu)) return false;
+                for (uint32_t b = 0; b < blocks; ++b) mcu[b] += step[b];
             }
             x0 += n;
         }
@@ -93,9 +100,11 @@ bool compress_band(EncoderContext* ctx, uint8_t** const* row_arrays) {
 
 bool process_band(EncoderContext* ctx) {
     if (ctx->failed != 0) return false;
-    format_traits(ctx->format)->read(ctx);
     SampleRowSet* rows = ctx->sample_rows;
-    const bool ok = compress_band(ctx, rows->row_arrays);
+    uint8_t** arrays[3] = {rows->row_arrays[0], rows->row_arrays[1], rows->row_arrays[2]};
+    InPlaceRows in_place;
+    if (!read_planar_in_place(ctx, in_place, arrays)) format_traits(ctx->format)->read(ctx);
+    const bool ok = compress_band(ctx, arrays);
     ++rows->band_counter;
     rows->band_flag = 0;
     return ok;

@@ -1,12 +1,8 @@
 // NEON row kernels of the input readers. The structure loads (vld3, vld4)
 // split the channels; seen as 16-bit lanes, each channel vector holds the
 // even pixels in its low bytes and the odd ones in its high bytes, which is
-// exactly the split that chroma from even pixels needs. The byte layouts
-// convert on 8-bit lanes (see below); RGB565, whose channels arrive as
-// 16-bit values, forms its sums in 32-bit lanes by widening
-// multiply-accumulate, the same integers as the portable code; the chroma
-// bias keeps them non-negative, so unsigned wrap-around in the intermediate
-// steps cancels out.
+// exactly the split that chroma from even pixels needs. The colour
+// conversion works on 8-bit lanes (see below).
 #include "input/pixel_kernels.h"
 
 #if defined(__ARM_NEON) || defined(__ARM_NEON__)
@@ -18,60 +14,7 @@
 namespace tekoj {
 namespace {
 
-struct Channels {
-    uint16x8_t r, g, b;
-};
-
-// The weights as vector lanes, loaded once per row: multiplies by a lane
-// keep GCC from rebuilding a scalar-duplicated constant in every iteration.
-// Lanes of `a`: luma R, G, B and the chroma weight 2048 (Cb of B, Cr of R);
-// lanes of `b`: the subtracted weights, Cb of R and G, Cr of G and B.
-struct Weights {
-    uint16x4_t a, b;
-};
-
-static_assert(rgb::kCbB == 2048 && rgb::kCrR == 2048);
-constexpr uint16_t kWeights[8] = {rgb::kYr, rgb::kYg, rgb::kYb, 2048, -rgb::kCbR, -rgb::kCbG, -rgb::kCrG, -rgb::kCrB};
-
-inline Weights weights() { return {vld1_u16(kWeights), vld1_u16(kWeights + 4)}; }
-
-inline uint16x4_t luma4(uint16x4_t r, uint16x4_t g, uint16x4_t b, const Weights& w) {
-    uint32x4_t s = vmull_lane_u16(r, w.a, 0);
-    s = vmlal_lane_u16(s, g, w.a, 1);
-    s = vmlal_lane_u16(s, b, w.a, 2);
-    return vshrn_n_u32(s, 12);
-}
-
-inline uint8x8_t luma8(const Channels& c, const Weights& w) {
-    return vmovn_u16(vcombine_u16(luma4(vget_low_u16(c.r), vget_low_u16(c.g), vget_low_u16(c.b), w),
-                                  luma4(vget_high_u16(c.r), vget_high_u16(c.g), vget_high_u16(c.b), w)));
-}
-
-inline uint16x4_t cb4(uint16x4_t r, uint16x4_t g, uint16x4_t b, const Weights& w) {
-    uint32x4_t s = vmlal_lane_u16(vdupq_n_u32(rgb::kChromaBias), b, w.a, 3);
-    s = vmlsl_lane_u16(s, r, w.b, 0);
-    s = vmlsl_lane_u16(s, g, w.b, 1);
-    return vshrn_n_u32(s, 12);
-}
-
-inline uint16x4_t cr4(uint16x4_t r, uint16x4_t g, uint16x4_t b, const Weights& w) {
-    uint32x4_t s = vmlal_lane_u16(vdupq_n_u32(rgb::kChromaBias), r, w.a, 3);
-    s = vmlsl_lane_u16(s, g, w.b, 2);
-    s = vmlsl_lane_u16(s, b, w.b, 3);
-    return vshrn_n_u32(s, 12);
-}
-
-inline uint8x8_t cb8(const Channels& c, const Weights& w) {
-    return vmovn_u16(vcombine_u16(cb4(vget_low_u16(c.r), vget_low_u16(c.g), vget_low_u16(c.b), w),
-                                  cb4(vget_high_u16(c.r), vget_high_u16(c.g), vget_high_u16(c.b), w)));
-}
-
-inline uint8x8_t cr8(const Channels& c, const Weights& w) {
-    return vmovn_u16(vcombine_u16(cr4(vget_low_u16(c.r), vget_low_u16(c.g), vget_low_u16(c.b), w),
-                                  cr4(vget_high_u16(c.r), vget_high_u16(c.g), vget_high_u16(c.b), w)));
-}
-
-// The byte layouts convert on 8-bit lanes with widening byte multiplies.
+// Colour conversion on 8-bit lanes with widening byte multiplies.
 // Each weight splits as w = 64 hi + lo with 0 <= lo < 64 (hi negative for
 // the negative chroma weights), so that both partial sums of three byte
 // products fit 16 bits: the fixed-point sum is S = 64 H + L with L >= 0, and
@@ -119,7 +62,8 @@ inline uint8x8_t cr_bytes(const Bytes3& c) {
     return finish(h, l);
 }
 
-// Sixteen pixels' channels.
+// Sixteen pixels' channels. The row loops below step their pointers on
+// rather than index from the row start: no index arithmetic per step.
 struct Pixels16 {
     uint8x16_t r, g, b;
 };
@@ -148,53 +92,52 @@ inline Bytes3 even8(const Pixels16& p) {
 
 template <int Bpp, bool Bgr, PickLayout Layout>
 void pick_upper(const uint8_t* src, uint32_t w, uint8_t* y, uint8_t* cb, uint8_t* cr) {
-    uint32_t x = 0;
-    for (; x + 16 <= w; x += 16) {
-        const Pixels16 px = load16<Bpp, Bgr>(src + static_cast<size_t>(x) * Bpp);
-        vst1q_u8(y + x, luma16(px));
+    for (uint32_t n = w / 16; n > 0; --n, src += 16 * Bpp, y += 16, cb += 8, cr += 8) {
+        const Pixels16 px = load16<Bpp, Bgr>(src);
+        vst1q_u8(y, luma16(px));
         const Bytes3 even = even8(px);
-        vst1_u8(cb + x / 2, cb_bytes(even));
-        vst1_u8(cr + x / 2, cr_bytes(even));
+        vst1_u8(cb, cb_bytes(even));
+        vst1_u8(cr, cr_bytes(even));
     }
-    kPortableInputKernels.pick_upper[Layout](src + static_cast<size_t>(x) * Bpp, w - x, y + x, cb + x / 2, cr + x / 2);
+    kPortableInputKernels.pick_upper[Layout](src, w % 16, y, cb, cr);
 }
 
 template <int Bpp, bool Bgr, PickLayout Layout>
 void pick_lower(const uint8_t* src, uint32_t w, uint8_t* y) {
-    uint32_t x = 0;
-    for (; x + 16 <= w; x += 16) vst1q_u8(y + x, luma16(load16<Bpp, Bgr>(src + static_cast<size_t>(x) * Bpp)));
-    kPortableInputKernels.pick_lower[Layout](src + static_cast<size_t>(x) * Bpp, w - x, y + x);
+    for (uint32_t n = w / 16; n > 0; --n, src += 16 * Bpp, y += 16) vst1q_u8(y, luma16(load16<Bpp, Bgr>(src)));
+    kPortableInputKernels.pick_lower[Layout](src, w % 16, y);
 }
 
-// Each 5- or 6-bit field moves to the top of a byte plus half a step.
-inline Channels expand565(uint16x8_t p) {
-    return {vaddq_u16(vandq_u16(vshrq_n_u16(p, 8), vdupq_n_u16(0xF8)), vdupq_n_u16(4)),
-            vaddq_u16(vandq_u16(vshrq_n_u16(p, 3), vdupq_n_u16(0xFC)), vdupq_n_u16(2)),
-            vaddq_u16(vandq_u16(vshlq_n_u16(p, 3), vdupq_n_u16(0xF8)), vdupq_n_u16(4))};
+// Each 5- or 6-bit field moves to the top of a byte plus half a step
+// (the low bits are clear, so the half step is an or).
+inline Bytes3 expand565(uint16x8_t p) {
+    return {vorr_u8(vand_u8(vshrn_n_u16(p, 8), vdup_n_u8(0xF8)), vdup_n_u8(4)),
+            vorr_u8(vand_u8(vshrn_n_u16(p, 3), vdup_n_u8(0xFC)), vdup_n_u8(2)),
+            vorr_u8(vshl_n_u8(vmovn_u16(p), 3), vdup_n_u8(4))};
+}
+
+// Sum of four bytes per lane, for the block average.
+inline uint16x8_t sum4(uint8x8_t a, uint8x8_t b, uint8x8_t c, uint8x8_t d) {
+    return vaddq_u16(vaddl_u8(a, b), vaddl_u8(c, d));
 }
 
 void rgb565_blocks(const uint8_t* upper, const uint8_t* lower, uint32_t blocks, uint8_t* y0, uint8_t* y1, uint8_t* cb,
                    uint8_t* cr) {
-    const Weights wt = weights();
-    uint32_t k = 0;
-    for (; k + 8 <= blocks; k += 8) {
+    for (uint32_t n = blocks / 8; n > 0; --n, upper += 32, lower += 32, y0 += 16, y1 += 16, cb += 8, cr += 8) {
         // Even and odd pixels of 16-pixel runs of both rows.
-        const uint16x8x2_t u = vld2q_u16(reinterpret_cast<const uint16_t*>(upper + 4 * k));
-        const uint16x8x2_t l = vld2q_u16(reinterpret_cast<const uint16_t*>(lower + 4 * k));
-        const Channels ue = expand565(u.val[0]), uo = expand565(u.val[1]);
-        const Channels le = expand565(l.val[0]), lo = expand565(l.val[1]);
-        vst2_u8(y0 + 2 * k, (uint8x8x2_t{{luma8(ue, wt), luma8(uo, wt)}}));
-        vst2_u8(y1 + 2 * k, (uint8x8x2_t{{luma8(le, wt), luma8(lo, wt)}}));
-        // Green alone gets the rounding term of the average.
-        const Channels avg{
-            vshrq_n_u16(vaddq_u16(vaddq_u16(ue.r, uo.r), vaddq_u16(le.r, lo.r)), 2),
-            vshrq_n_u16(vaddq_u16(vaddq_u16(vaddq_u16(ue.g, uo.g), vaddq_u16(le.g, lo.g)), vdupq_n_u16(2)), 2),
-            vshrq_n_u16(vaddq_u16(vaddq_u16(ue.b, uo.b), vaddq_u16(le.b, lo.b)), 2)};
-        vst1_u8(cb + k, cb8(avg, wt));
-        vst1_u8(cr + k, cr8(avg, wt));
+        const uint16x8x2_t u = vld2q_u16(reinterpret_cast<const uint16_t*>(upper));
+        const uint16x8x2_t l = vld2q_u16(reinterpret_cast<const uint16_t*>(lower));
+        const Bytes3 ue = expand565(u.val[0]), uo = expand565(u.val[1]);
+        const Bytes3 le = expand565(l.val[0]), lo = expand565(l.val[1]);
+        vst2_u8(y0, (uint8x8x2_t{{luma_bytes(ue), luma_bytes(uo)}}));
+        vst2_u8(y1, (uint8x8x2_t{{luma_bytes(le), luma_bytes(lo)}}));
+        // Green alone gets the rounding term of the average: a rounding shift.
+        const Bytes3 avg{vshrn_n_u16(sum4(ue.r, uo.r, le.r, lo.r), 2), vrshrn_n_u16(sum4(ue.g, uo.g, le.g, lo.g), 2),
+                         vshrn_n_u16(sum4(ue.b, uo.b, le.b, lo.b), 2)};
+        vst1_u8(cb, cb_bytes(avg));
+        vst1_u8(cr, cr_bytes(avg));
     }
-    kPortableInputKernels.rgb565_blocks(upper + 4 * k, lower + 4 * k, blocks - k, y0 + 2 * k, y1 + 2 * k, cb + k,
-                                        cr + k);
+    kPortableInputKernels.rgb565_blocks(upper, lower, blocks % 8, y0, y1, cb, cr);
 }
 
 // Packed 4:2:2: sixteen groups per step, split into Y0, U, Y1 and V by one

@@ -86,6 +86,26 @@ SplitVuFn split_vu_for(SimdLevel level) {
     return split_vu_portable;
 }
 
+bool read_planar_in_place(EncoderContext* ctx, InPlaceRows& storage, uint8_t** (&arrays)[3]) {
+    if (!format_traits(ctx->format)->planar) return false;
+    const uint32_t components = ctx->num_components < 3 ? ctx->num_components : 3;
+    for (uint32_t c = 0; c < components; ++c) {
+        const ComponentInfo& comp = ctx->comp_info[c];
+        if (comp.downsampled_width != comp.padded_width || comp.rows_this_band != comp.band_rows ||
+            comp.band_rows > 16)
+            return false;
+    }
+    const uint8_t** planes[3] = {&ctx->plane_y, &ctx->plane_u, &ctx->plane_v};
+    for (uint32_t c = 0; c < components; ++c) {
+        const ComponentInfo& comp = ctx->comp_info[c];
+        for (uint32_t r = 0; r < comp.band_rows; ++r)
+            storage.rows[c][r] = const_cast<uint8_t*>(*planes[c] + static_cast<size_t>(r) * comp.downsampled_width);
+        *planes[c] += static_cast<size_t>(comp.band_rows) * comp.downsampled_width;
+        arrays[c] = storage.rows[c];
+    }
+    return true;
+}
+
 void seek_band(EncoderContext* ctx, const ReadOrigin& origin, uint32_t band) {
     const FormatTraits* format = format_traits(ctx->format);
     if (format->planar) {
