@@ -23,9 +23,9 @@
 #include "input/readers.h"
 #include "sink/output_target.h"
 
+#include <algorithm>
 #include <condition_variable>
 #include <mutex>
-#include <algorithm>
 #include <new>
 
 namespace tekoj {
