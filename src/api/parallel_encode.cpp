@@ -23,9 +23,9 @@
 #include "input/readers.h"
 #include "sink/output_target.h"
 
+#include <algorithm>
 #include <condition_variable>
 #include <mutex>
-#include <algorithm>
 #include <new>
 
 namespace tekoj {
@@ -185,11 +185,15 @@ bool prepare(Encode* e) {
     const EncoderContext* main = e->main;
     // Serial mode codes on the main context; its workers only take turns.
     if (e->serial) return (e->worker = allocate_zeroed<Worker>(e->workers)) != nullptr;
-    // The window is what lets a worker run on past a row that another is
-    // still coding: a slow row, or one whose thread lost its core for a
-    // time slice, which on a loaded device is worth dozens of rows. Up to
-    // 16 rows per worker, within kWindowCapacity of row buffers in all
-    // (their capacity is a pessimistic guess; a row touches a fraction).
+    // A deep window of row buffers pays twice. A buffer comes round again
+    // only after many rows, by when the lines that one core wrote and the
+    // hand-on read have left the other core's cache: with 2 buffers per
+    // worker rows were coded a fifth slower, fetching their output lines
+    // from the other core. And a worker runs on past a row that another
+    // is still coding, a slow one or one whose thread lost its core for a
+    // time slice (on a loaded device worth dozens of rows). Up to 16 rows
+    // per worker, within kWindowCapacity of row buffers in all (their
+    // capacity is a pessimistic guess; a row touches a fraction).
     const uint64_t row_guess = uint64_t{main->mcus_per_row} * main->blocks_in_mcu * 48u + 64u;
     const uint64_t fit = kWindowCapacity / (row_guess * e->workers);
     const uint32_t depth = static_cast<uint32_t>(std::clamp<uint64_t>(fit, 2, 16));

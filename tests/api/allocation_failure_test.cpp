@@ -7,7 +7,6 @@
 #include <TekoJEncoderInternal.h>
 
 #include "incremental/incremental_support.h"
-#include "support/fault_os_layer.h"
 #include "support/test_support.h"
 
 #include <gtest/gtest.h>

@@ -5,7 +5,6 @@
 // written and never writing past their capacity.
 #include <TekoJEncoderInternal.h>
 
-#include "support/fault_os_layer.h"
 #include "support/test_support.h"
 
 #include <gtest/gtest.h>
@@ -77,8 +76,9 @@ TEST(EntryPoints, EverySmallSizeFormatQualityAndOutputKindDecodesCleanlyAndAgree
     // put chroma DC differences in the largest category (11); tiles of noise
     // at quality 100 are the densest data the coder can be given, so memory
     // targets grow from short blocks (the sanitizer build turns a write past
-    // a block into a failure). The memory stream is the reference; the other
-    // members take turns.
+    // a block into a failure). The coarsest and finest tables (every
+    // quality's tables are pinned by the header test). The memory stream is
+    // the reference; the other members take turns.
     const std::string path = temp_path("small.jpg");
     int turn = 0;
     for (int w = 1; w <= 48; ++w)
@@ -92,7 +92,7 @@ TEST(EntryPoints, EverySmallSizeFormatQualityAndOutputKindDecodesCleanlyAndAgree
             for (uint32_t format : kFormats) {
                 const Bytes px = rgb_to_format(rgb, w, h, format);
                 const ImageInfo info = image_info(px.data(), w, h, format);
-                for (uint32_t q : {1u, 50u, 100u}) {
+                for (uint32_t q : {1u, 100u}) {
                     const Bytes memory = encode_to_memory(info, q);
                     const Decoded d = decode_jpeg(memory);
                     ASSERT_TRUE(d.ok && !d.warning && d.width == w && d.height == h) << describe(format, w, h, q) << d.message;

@@ -101,9 +101,10 @@ TEST(Parallel, SameStreamForEveryThreadCountFormatSizeAndOutput) {
 }
 
 TEST(Parallel, ExifSettingsAndTallImages) {
-    // A tall image whose rows outnumber the window many times over.
-    const Bytes tall = photo_rgb(72, 1500, 3);
-    ImageInfo info = image_info(tall.data(), 72, 1500, EKO_FORMAT_RGB888);
+    // A tall image whose rows outnumber the window (16 rows per worker)
+    // many times over.
+    const Bytes tall = photo_rgb(72, 8000, 3);
+    ImageInfo info = image_info(tall.data(), 72, 8000, EKO_FORMAT_RGB888);
     for (const uint32_t kind : kKinds) EXPECT_EQ(parallel(info, kind, 3), encode_to_memory(info, 75));
 
     // EXIF with a thumbnail, which a file or stream target gets in one piece.

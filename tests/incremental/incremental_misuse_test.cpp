@@ -1,7 +1,6 @@
 // Calls the incremental interface must refuse without touching the stream,
 // and failures that must leak nothing and hand back no partial stream.
 #include "incremental/incremental_support.h"
-#include "support/fault_os_layer.h"
 
 #include <gtest/gtest.h>
 

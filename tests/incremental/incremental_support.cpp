@@ -1,5 +1,4 @@
 #include "incremental/incremental_support.h"
-#include "support/fault_os_layer.h"
 
 #include <algorithm>
 #include <cstdio>

@@ -2,7 +2,6 @@
 // straight into the encoder as format 2.
 #include <TekoJEncoderInternal.h>
 
-#include "support/fault_os_layer.h"
 #include "support/test_support.h"
 
 #include <gtest/gtest.h>

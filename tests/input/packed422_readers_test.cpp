@@ -3,7 +3,6 @@
 // and decoded by libjpeg-turbo.
 #include <TekoJEncoderInternal.h>
 
-#include "support/fault_os_layer.h"
 #include "support/test_support.h"
 
 #include <gtest/gtest.h>

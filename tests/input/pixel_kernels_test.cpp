@@ -46,13 +46,12 @@ std::vector<KernelCase> kernel_cases() {
     const char* names[] = {"RGB888", "RGBA8888", "BGRA8888"};
     for (int layout = 0; layout < kPickLayouts; ++layout) {
         const uint32_t bpp = layout == kRgb888 ? 3 : 4;
+        // The upper row of a pair (luma and chroma), then the lower (luma).
         cases.push_back({names[layout], bpp, [layout](const InputKernels& k, const Bytes& src, uint32_t w) {
-                             return outputs({w, (w + 1) / 2, (w + 1) / 2}, [&](std::vector<Bytes>& o) {
+                             return outputs({w, (w + 1) / 2, (w + 1) / 2, w}, [&](std::vector<Bytes>& o) {
                                  k.pick_upper[layout](src.data(), w, o[0].data(), o[1].data(), o[2].data());
+                                 k.pick_lower[layout](src.data(), w, o[3].data());
                              });
-                         }});
-        cases.push_back({names[layout], bpp, [layout](const InputKernels& k, const Bytes& src, uint32_t w) {
-                             return outputs({w}, [&](std::vector<Bytes>& o) { k.pick_lower[layout](src.data(), w, o[0].data()); });
                          }});
     }
     // RGB565 and packed 4:2:2 take the source as an upper and a lower row
@@ -69,14 +68,10 @@ std::vector<KernelCase> kernel_cases() {
     cases.push_back({"4:2:2", 2, [](const InputKernels& k, const Bytes& src, uint32_t w) {
                          const uint32_t groups = w / 2;
                          const Bytes row(src.begin(), src.begin() + 4 * groups);
-                         return outputs({2 * groups, groups, groups}, [&](std::vector<Bytes>& o) {
+                         return outputs({2 * groups, groups, groups, 2 * groups}, [&](std::vector<Bytes>& o) {
                              k.split422(row.data(), groups, o[0].data(), o[1].data(), o[2].data());
+                             k.luma422(row.data(), groups, o[3].data());
                          });
-                     }});
-    cases.push_back({"4:2:2 luma", 2, [](const InputKernels& k, const Bytes& src, uint32_t w) {
-                         const uint32_t groups = w / 2;
-                         const Bytes row(src.begin(), src.begin() + 4 * groups);
-                         return outputs({2 * groups}, [&](std::vector<Bytes>& o) { k.luma422(row.data(), groups, o[0].data()); });
                      }});
     // Down-scaler: halving `w` groups into accumulator rows (start only,
     // finish only, both apart, both the same row), and the row writer with and
@@ -113,8 +108,6 @@ std::vector<Level> vector_levels() {
         if (const InputKernels* k = input_kernels_for(l)) levels.push_back({simd_level_name(l), k});
     return levels;
 }
-
-// Bytes that are often 0 or 255, so the extremes of every sum occur.
 
 void expect_levels_match(const Bytes& src, uint32_t w, const std::string& what) {
     for (const KernelCase& c : kernel_cases()) {

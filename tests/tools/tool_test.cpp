@@ -16,7 +16,7 @@
 #include <fcntl.h>
 #include <fstream>
 #include <signal.h>
-#include <sstream>
+#include <iterator>
 #include <sys/resource.h>
 #include <sys/stat.h>
 #include <sys/wait.h>
@@ -31,9 +31,7 @@ using Bytes = std::vector<uint8_t>;
 
 std::string read_text(const std::string& path) {
     std::ifstream f(path, std::ios::binary);
-    std::stringstream s;
-    s << f.rdbuf();
-    return s.str();
+    return std::string(std::istreambuf_iterator<char>(f), std::istreambuf_iterator<char>());
 }
 
 void write_file(const std::string& name, const std::string& bytes) {
