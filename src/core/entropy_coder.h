@@ -32,10 +32,7 @@ using BitAcc = uint32_t;
 
 // Bits waiting to be written: `acc` holds them at its low end (anything above
 // them was written already), `free` counts the unused bits of the word, `out`
-// is where the next byte goes. Between codes at most kMaxPendingBits wait: a
-// 64-bit word keeps room for the longest code (26 bits) at all times.
-inline constexpr int kMaxPendingBits = sizeof(BitAcc) == 8 ? 64 - 26 : 31;
-
+// is where the next byte goes.
 struct BitState {
     BitAcc acc;
     int32_t free;

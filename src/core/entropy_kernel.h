@@ -61,34 +61,15 @@ inline void write_byte(uint8_t*& out, uint32_t b) {
 // Appends the low `size` bits of `code` (nothing above them set); size is at
 // most 26.
 [[gnu::always_inline]] inline void put(BitState& w, uint32_t code, int size) {
-    if constexpr (sizeof(BitAcc) == 8) {
-        // A 64-bit word keeps at least 26 bits free before each code, so the
-        // code always fits, and writes its oldest 32 bits once fewer are
-        // free: the common path has no carry-over between words.
+    w.free -= size;
+    if (__builtin_expect(w.free >= 0, 1)) {
         w.acc = (w.acc << size) | code;
-        w.free -= size;
-        if (__builtin_expect(w.free < 26, 0)) {
-            const uint32_t word = static_cast<uint32_t>(w.acc >> (32 - w.free));
-            if (!has_ff_byte(word)) [[likely]] {
-                const uint32_t be = __builtin_bswap32(word);
-                std::memcpy(w.out, &be, sizeof be);
-                w.out += sizeof be;
-            } else {
-                for (int s = 24; s >= 0; s -= 8) write_byte(w.out, (word >> s) & 0xFF);
-            }
-            w.free += 32;
-        }
     } else {
-        w.free -= size;
-        if (__builtin_expect(w.free >= 0, 1)) {
-            w.acc = (w.acc << size) | code;
-        } else {
-            // Fill the word, write it, keep the rest of the code.
-            w.acc = (w.acc << (size + w.free)) | (code >> -w.free);
-            flush_word(w);
-            w.acc = code;
-            w.free += kAccBits;
-        }
+        // Fill the word, write it, keep the rest of the code.
+        w.acc = (w.acc << (size + w.free)) | (code >> -w.free);
+        flush_word(w);
+        w.acc = code;
+        w.free += kAccBits;
     }
 }
 
@@ -258,6 +239,22 @@ template <bool kInRange>
             put(w, (entry >> 5) | ((t << z) >> z), static_cast<int>(entry & 31));
         }
     };
+    if constexpr (!kScanFromTop) {
+        // One word: each position comes from the bitmap with its lowest bit
+        // cleared, which is one step, so the loop's chain from position to
+        // position stays short (shifting the word on would lengthen it).
+        uint64_t m = map.word[0];
+        Count last = 0;  // the DC position counts as coded
+        while (m != 0) {
+            const Count p = std::countr_zero(m);
+            m &= m - 1;
+            code(p - last - 1, offsets + p);
+            last = p;
+        }
+        put(w, ac[0] >> 5, static_cast<int>(ac[0] & 31));  // EOB
+        state = w;
+        return;
+    }
     // `carry`: zeros since the last coded position that belong to the next
     // run (the DC position counts as coded, hence -1 before position 0).
     Count carry = -1;

@@ -86,7 +86,7 @@ constexpr uint32_t kMaxKernelDivisor = 65536;
 // that is all ones where the word is 32768 or more (`wide`): then
 // x * m = x * int16(mul) + (x & wide) * 65536. `narrow` tells that every
 // word is below 32768 (quantiser steps of 3 and more in the transform's
-// scale, every table up to quality 90 or so), so `mul` holds the words
+// scale: every quality up to 97), so `mul` holds the words
 // themselves and no lane needs the wide correction.
 struct QuantTable {
     const uint32_t* divisors;
