@@ -63,6 +63,10 @@ namespace tekoj {
 // made room for blocks_in_mcu * kBlockWorstCase bytes.
 using McuKernel = void (*)(BitState& bits, const ::EkoCoderTables& tables, int16_t* const* blocks, int32_t* last_dc);
 
+// Words of one AC table in the coder's tables (see EkoCoderTables::ac).
+inline constexpr uint32_t kSmallValueLimit = 63;
+inline constexpr uint32_t kAcTableWords = 256 + (sizeof(BitAcc) == 8 ? 16 * 128 : 0);
+
 }  // namespace tekoj
 
 // Read-only coding tables of one encode. A code table entry holds, for one
@@ -73,7 +77,10 @@ using McuKernel = void (*)(BitState& bits, const ::EkoCoderTables& tables, int16
 // (Declared outside the namespace: the context names it.)
 struct EkoCoderTables {
     uint32_t dc[2][16];
-    uint32_t ac[2][256];
+    // Per AC table: the 256 symbol entries, then on 64-bit processors the
+    // entries of small values with their extra bits already in place:
+    // [256 + 128 * run + value + 63] for runs 0..15 and values within +-63.
+    uint32_t ac[2][tekoj::kAcTableWords];
     tekoj::BlockKernel kernel;   // one block
     tekoj::McuKernel mcu_kernel;  // all blocks of an MCU, when room for all is certain
     uint32_t mcu_room;  // free bytes that let an MCU through without room checks

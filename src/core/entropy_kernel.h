@@ -211,6 +211,7 @@ template <bool kInRange>
     const char* base = reinterpret_cast<const char*>(values);
     const uint32_t* ac_top = ac + 32;  // ac_top[16 * run - z]: the entry of category 32 - z
     const uint32_t* value_codes = kValueCodes.entry + 1023;  // indexed by the value
+    const uint32_t* small = ac + 256;                          // see EkoCoderTables::ac
     auto code = [&](Count run, const uint8_t* at) __attribute__((always_inline)) {
         while (run > 15) [[unlikely]] {
             put(w, ac[0xF0] >> 5, static_cast<int>(ac[0xF0] & 31));
@@ -218,6 +219,15 @@ template <bool kInRange>
         }
         int16_t v;
         std::memcpy(&v, base + *at, sizeof v);
+        if constexpr (kAcTableWords > 256) {
+            // Small values: code, extra bits and length in one entry.
+            const uint32_t index = static_cast<uint32_t>(v + static_cast<int32_t>(kSmallValueLimit));
+            if (__builtin_expect(index <= 2 * kSmallValueLimit, 1)) {
+                const uint32_t entry = small[run * 128 + static_cast<Count>(index)];
+                put(w, entry >> 5, static_cast<int>(entry & 31));
+                return;
+            }
+        }
         if constexpr (kInRange) {
             // Category and extra bits by table lookup.
             const uint32_t value_code = value_codes[static_cast<Count>(v)];
