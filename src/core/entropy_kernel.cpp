@@ -16,7 +16,7 @@ inline ScanMap nonzero_map(const int16_t* block) {
 
 [[gnu::always_inline]] inline void code_block_portable(BitState& bits, int32_t dc_diff, const int16_t* block,
                                                       const uint32_t* dc, const uint32_t* ac) {
-    code_block_from_map<false>(bits, dc_diff, dc, ac, nonzero_map(block), block, kScanOffsets.natural);
+    code_block_from_map(bits, dc_diff, dc, ac, nonzero_map(block), block, kScanOffsets.natural);
 }
 
 }  // namespace

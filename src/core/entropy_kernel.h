@@ -168,35 +168,13 @@ constexpr ScanOffsets make_scan_offsets() {
 
 inline constexpr ScanOffsets kScanOffsets = make_scan_offsets();
 
-// Category and extra bits of every AC value the baseline tables can code:
-// entry x + 1023 holds the category in its low byte and the extra bits above.
-struct ValueCodes {
-    uint32_t entry[2047];
-};
-
-constexpr ValueCodes make_value_codes() {
-    ValueCodes t{};
-    for (int x = -1023; x <= 1023; ++x) {
-        int k = 0;
-        for (int a = x < 0 ? -x : x; a != 0; a >>= 1) ++k;
-        const uint32_t extra = static_cast<uint32_t>(x < 0 ? x - 1 : x) & ((1u << k) - 1);
-        t.entry[x + 1023] = static_cast<uint32_t>(k) | extra << 8;
-    }
-    return t;
-}
-
-inline constexpr ValueCodes kValueCodes = make_value_codes();
-
 // A biased value beyond +-1023 as +-1023 (category 10) is biased; out of
 // line, so that the coding loop keeps the sign only where it needs it.
 [[gnu::noinline]] inline uint32_t limited(uint32_t t) { return 0x3FFu ^ static_cast<uint32_t>(static_cast<int32_t>(t) >> 31); }
 
 // Codes a block: the DC difference, then the AC positions set in `map`
 // (positions 1..62 at most), limited to +-1023, then EOB. The value at
-// position p is the int16 at byte offset offsets[p] of `values`. With
-// kInRange the caller has made sure that every AC value lies within
-// +-1023, and category and extra bits come from one table lookup.
-template <bool kInRange>
+// position p is the int16 at byte offset offsets[p] of `values`.
 [[gnu::always_inline]] inline void code_block_from_map(BitState& state, int32_t dc_diff, const uint32_t* dc,
                                                       const uint32_t* ac, const ScanMap& map, const int16_t* values,
                                                       const uint8_t* offsets) {
@@ -210,7 +188,6 @@ template <bool kInRange>
     }
     const char* base = reinterpret_cast<const char*>(values);
     const uint32_t* ac_top = ac + 32;  // ac_top[16 * run - z]: the entry of category 32 - z
-    const uint32_t* value_codes = kValueCodes.entry + 1023;  // indexed by the value
     const uint32_t* small = ac + 256;                          // see EkoCoderTables::ac
     auto code = [&](Count run, const uint8_t* at) __attribute__((always_inline)) {
         while (run > 15) [[unlikely]] {
@@ -228,26 +205,18 @@ template <bool kInRange>
                 return;
             }
         }
-        if constexpr (kInRange) {
-            // Category and extra bits by table lookup.
-            const uint32_t value_code = value_codes[static_cast<Count>(v)];
-            const uint32_t entry = ac[run * 16 + static_cast<Count>(value_code & 0xFF)];
-            put(w, (entry >> 5) | (value_code >> 8), static_cast<int>(entry & 31));
-        } else {
-            // Computed, which on 32-bit ARM takes fewer steps than the lookup
-            // and its range check: t is the value, less one when negative
-            // (its low bits are the extra bits), t ^ sign the magnitude.
-            const int32_t ts = v + (v >> 31);
-            uint32_t t = static_cast<uint32_t>(ts);
-            Count z = __builtin_clz(t ^ static_cast<uint32_t>(ts >> 31));  // 32 - category; the value is not 0
-            if (__builtin_expect(z < 22, 0)) {
-                t = limited(t);
-                z = 22;
-            }
-            // The entry of category 32 - z.
-            const uint32_t entry = ac_top[run * 16 - z];
-            put(w, (entry >> 5) | ((t << z) >> z), static_cast<int>(entry & 31));
+        // Category and extra bits computed: t is the value, less one when
+        // negative (its low bits are the extra bits), t ^ sign the magnitude.
+        const int32_t ts = v + (v >> 31);
+        uint32_t t = static_cast<uint32_t>(ts);
+        Count z = __builtin_clz(t ^ static_cast<uint32_t>(ts >> 31));  // 32 - category; the value is not 0
+        if (__builtin_expect(z < 22, 0)) {
+            t = limited(t);
+            z = 22;
         }
+        // The entry of category 32 - z.
+        const uint32_t entry = ac_top[run * 16 - z];
+        put(w, (entry >> 5) | ((t << z) >> z), static_cast<int>(entry & 31));
     };
     if constexpr (!kScanFromTop) {
         // One word: each position comes from the bitmap with its lowest bit

@@ -36,19 +36,11 @@ namespace {
                                               const uint32_t* ac) {
     const __m128i zero = _mm_setzero_si128();
     __m128i flags[4];  // 0xFF for each zero coefficient, natural order
-    __m128i hi = _mm_set1_epi16(-32768), lo = _mm_set1_epi16(32767);
     for (int s = 0; s < 4; ++s) {
         const __m128i a = _mm_loadu_si128(reinterpret_cast<const __m128i*>(block + 16 * s));
         const __m128i b = _mm_loadu_si128(reinterpret_cast<const __m128i*>(block + 16 * s + 8));
         flags[s] = _mm_packs_epi16(_mm_cmpeq_epi16(a, zero), _mm_cmpeq_epi16(b, zero));
-        // The DC (first lane) does not count towards the range.
-        const __m128i a_ac = s == 0 ? _mm_insert_epi16(a, 0, 0) : a;
-        hi = _mm_max_epi16(hi, _mm_max_epi16(a_ac, b));
-        lo = _mm_min_epi16(lo, _mm_min_epi16(a_ac, b));
     }
-    // Every AC value within +-1023: category and extra bits by table lookup.
-    const bool in_range = _mm_movemask_epi8(_mm_or_si128(_mm_cmpgt_epi16(hi, _mm_set1_epi16(1023)),
-                                                         _mm_cmplt_epi16(lo, _mm_set1_epi16(-1023)))) == 0;
     uint64_t zeros = 0;
     for (int c = 0; c < 4; ++c) {
         __m128i z = zero;
@@ -58,11 +50,7 @@ namespace {
         zeros |= static_cast<uint64_t>(static_cast<uint32_t>(_mm_movemask_epi8(z))) << (16 * c);
     }
     const uint64_t mask = ~zeros & 0x7FFFFFFFFFFFFFFEull;
-    if (in_range) [[likely]] {
-        code_block_from_map<true>(bits, dc_diff, dc, ac, ScanMap{{mask}}, block, kScanOffsets.natural);
-    } else {
-        code_block_from_map<false>(bits, dc_diff, dc, ac, ScanMap{{mask}}, block, kScanOffsets.natural);
-    }
+    code_block_from_map(bits, dc_diff, dc, ac, ScanMap{{mask}}, block, kScanOffsets.natural);
 }
 
 }  // namespace

@@ -87,7 +87,7 @@ namespace {
     } else {
         map.word[0] = static_cast<ScanWord>(vget_lane_u64(vreinterpret_u64_u8(s), 0) & 0x7FFFFFFFFFFFFFFEull);
     }
-    code_block_from_map<false>(bits, dc_diff, dc, ac, map, block, kScanOffsets.natural);
+    code_block_from_map(bits, dc_diff, dc, ac, map, block, kScanOffsets.natural);
 }
 
 }  // namespace
