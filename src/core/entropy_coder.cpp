@@ -117,20 +117,18 @@ bool build_coder_tables(EncoderContext* ctx) {
         const AcCodeTable* ac = es->ac_codes[n];
         for (uint32_t k = 0; k < 12; ++k) t->dc[n][k] = combined(dc->code[k], dc->size[k], k);
         for (uint32_t s = 0; s < 256; ++s) t->ac[n][s] = combined(ac->code[s], ac->size[s], s & 15);
-        if constexpr (kAcTableWords > 256) {
-            // Small values with their extra bits: one lookup codes them.
-            constexpr int32_t kLimit = static_cast<int32_t>(kSmallValueLimit);
-            for (uint32_t run = 0; run < 16; ++run)
-                for (int32_t v = -kLimit; v <= kLimit; ++v) {
-                    const uint32_t magnitude = static_cast<uint32_t>(v < 0 ? -v : v);
-                    const uint32_t k = static_cast<uint32_t>(std::bit_width(magnitude));
-                    const uint32_t entry = t->ac[n][(run << 4) | k];
-                    const uint32_t extra = static_cast<uint32_t>(v < 0 ? v - 1 : v) & ((1u << k) - 1);
-                    // (A symbol the table lacks codes as the other paths do: its
-                    // extra bits with no length.)
-                    t->ac[n][256 + 128 * run + static_cast<uint32_t>(v + kLimit)] = entry | extra << 5;
-                }
-        }
+        // Small values with their extra bits: one lookup codes them.
+        constexpr int32_t kLimit = static_cast<int32_t>(kSmallValueLimit);
+        for (uint32_t run = 0; run < 16; ++run)
+            for (int32_t v = -kLimit; v <= kLimit; ++v) {
+                const uint32_t magnitude = static_cast<uint32_t>(v < 0 ? -v : v);
+                const uint32_t k = static_cast<uint32_t>(std::bit_width(magnitude));
+                const uint32_t entry = t->ac[n][(run << 4) | k];
+                const uint32_t extra = static_cast<uint32_t>(v < 0 ? v - 1 : v) & ((1u << k) - 1);
+                // (A symbol the table lacks codes as the other paths do: its
+                // extra bits with no length.)
+                t->ac[n][256 + 128 * run + static_cast<uint32_t>(v + kLimit)] = entry | extra << 5;
+            }
     }
     const CoderKernels kernels = coder_kernels_for(static_cast<int>(simd_level()));
     t->kernel = kernels.block;

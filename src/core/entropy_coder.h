@@ -65,7 +65,7 @@ using McuKernel = void (*)(BitState& bits, const ::EkoCoderTables& tables, int16
 
 // Words of one AC table in the coder's tables (see EkoCoderTables::ac).
 inline constexpr uint32_t kSmallValueLimit = 63;
-inline constexpr uint32_t kAcTableWords = 256 + (sizeof(BitAcc) == 8 ? 16 * 128 : 0);
+inline constexpr uint32_t kAcTableWords = 256 + 16 * 128;
 
 }  // namespace tekoj
 
@@ -77,9 +77,9 @@ inline constexpr uint32_t kAcTableWords = 256 + (sizeof(BitAcc) == 8 ? 16 * 128 
 // (Declared outside the namespace: the context names it.)
 struct EkoCoderTables {
     uint32_t dc[2][16];
-    // Per AC table: the 256 symbol entries, then on 64-bit processors the
-    // entries of small values with their extra bits already in place:
-    // [256 + 128 * run + value + 63] for runs 0..15 and values within +-63.
+    // Per AC table: the 256 symbol entries, then the entries of small
+    // values with their extra bits already in place: [256 + 128 * run +
+    // value + 63] for runs 0..15 and values within +-63.
     uint32_t ac[2][tekoj::kAcTableWords];
     tekoj::BlockKernel kernel;   // one block
     tekoj::McuKernel mcu_kernel;  // all blocks of an MCU, when room for all is certain

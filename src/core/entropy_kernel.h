@@ -196,16 +196,14 @@ inline constexpr ScanOffsets kScanOffsets = make_scan_offsets();
         }
         int16_t v;
         std::memcpy(&v, base + *at, sizeof v);
-        if constexpr (kAcTableWords > 256) {
-            // Small values: code, extra bits and length in one entry.
-            const uint32_t index = static_cast<uint32_t>(v + static_cast<int32_t>(kSmallValueLimit));
-            if (__builtin_expect(index <= 2 * kSmallValueLimit, 1)) {
-                const uint32_t entry = small[run * 128 + static_cast<Count>(index)];
-                put(w, entry >> 5, static_cast<int>(entry & 31));
-                return;
-            }
+        // Small values (nearly all): code, extra bits and length in one entry.
+        const uint32_t index = static_cast<uint32_t>(v + static_cast<int32_t>(kSmallValueLimit));
+        if (__builtin_expect(index <= 2 * kSmallValueLimit, 1)) {
+            const uint32_t entry = small[run * 128 + static_cast<Count>(index)];
+            put(w, entry >> 5, static_cast<int>(entry & 31));
+            return;
         }
-        // Category and extra bits computed: t is the value, less one when
+        // Larger ones: category and extra bits computed: t is the value, less one when
         // negative (its low bits are the extra bits), t ^ sign the magnitude.
         const int32_t ts = v + (v >> 31);
         uint32_t t = static_cast<uint32_t>(ts);
