@@ -73,6 +73,19 @@ inline void write_byte(uint8_t*& out, uint32_t b) {
     }
 }
 
+// Appends up to 52 bits to a 64-bit word, as put() does.
+[[gnu::always_inline]] inline void put_long(BitState& w, uint64_t code, int size) {
+    w.free -= size;
+    if (__builtin_expect(w.free >= 0, 1)) {
+        w.acc = (w.acc << size) | code;
+    } else {
+        w.acc = (w.acc << (size + w.free)) | (code >> -w.free);
+        flush_word(w);
+        w.acc = code;
+        w.free += kAccBits;
+    }
+}
+
 // Writes every whole waiting byte, leaving at most 7 bits.
 inline void flush_whole_bytes(BitState& w) {
     int pending = kAccBits - w.free;
@@ -220,13 +233,38 @@ inline constexpr ScanOffsets kScanOffsets = make_scan_offsets();
         // One word: each position comes from the bitmap with its lowest bit
         // cleared, which is one step, so the loop's chain from position to
         // position stays short (shifting the word on would lengthen it).
+        // Two neighbouring small values with short runs go into the word as
+        // one code of up to 52 bits: half the appends.
         uint64_t m = map.word[0];
         Count last = 0;  // the DC position counts as coded
+        auto small_entry = [&](Count run, Count p, uint32_t& entry) __attribute__((always_inline)) {
+            int16_t v;
+            std::memcpy(&v, base + offsets[p], sizeof v);
+            const uint32_t index = static_cast<uint32_t>(v + static_cast<int32_t>(kSmallValueLimit));
+            if (run > 15 || index > 2 * kSmallValueLimit) return false;
+            entry = small[run * 128 + static_cast<Count>(index)];
+            return true;
+        };
         while (m != 0) {
             const Count p = std::countr_zero(m);
             m &= m - 1;
-            code(p - last - 1, offsets + p);
+            uint32_t first;
+            if (!small_entry(p - last - 1, p, first)) {
+                code(p - last - 1, offsets + p);
+                last = p;
+                continue;
+            }
             last = p;
+            uint32_t second;
+            if (m == 0 || !small_entry(std::countr_zero(m) - last - 1, std::countr_zero(m), second)) {
+                put(w, first >> 5, static_cast<int>(first & 31));
+                continue;
+            }
+            last = std::countr_zero(m);
+            m &= m - 1;
+            const int second_size = static_cast<int>(second & 31);
+            put_long(w, static_cast<uint64_t>(first >> 5) << second_size | (second >> 5),
+                     static_cast<int>(first & 31) + second_size);
         }
         put(w, ac[0] >> 5, static_cast<int>(ac[0] & 31));  // EOB
         state = w;
