@@ -127,7 +127,7 @@ bool build_coder_tables(EncoderContext* ctx) {
                 const uint32_t extra = static_cast<uint32_t>(v < 0 ? v - 1 : v) & ((1u << k) - 1);
                 // (A symbol the table lacks codes as the other paths do: its
                 // extra bits with no length.)
-                t->ac[n][256 + 128 * run + static_cast<uint32_t>(v + kLimit)] = entry | extra << 5;
+                t->ac[n][256 + kSmallRunStride * run + static_cast<uint32_t>(v + kLimit)] = entry | extra << 5;
             }
     }
     const CoderKernels kernels = coder_kernels_for(static_cast<int>(simd_level()));

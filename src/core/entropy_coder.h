@@ -65,7 +65,8 @@ using McuKernel = void (*)(BitState& bits, const ::EkoCoderTables& tables, int16
 
 // Words of one AC table in the coder's tables (see EkoCoderTables::ac).
 inline constexpr uint32_t kSmallValueLimit = 63;
-inline constexpr uint32_t kAcTableWords = 256 + 16 * 128;
+inline constexpr uint32_t kSmallRunStride = 2 * kSmallValueLimit + 2;
+inline constexpr uint32_t kAcTableWords = 256 + 16 * kSmallRunStride;
 
 }  // namespace tekoj
 
@@ -78,8 +79,9 @@ inline constexpr uint32_t kAcTableWords = 256 + 16 * 128;
 struct EkoCoderTables {
     uint32_t dc[2][16];
     // Per AC table: the 256 symbol entries, then the entries of small
-    // values with their extra bits already in place: [256 + 128 * run +
-    // value + 63] for runs 0..15 and values within +-63.
+    // values with their extra bits already in place: [256 +
+    // kSmallRunStride * run + value + kSmallValueLimit] for runs 0..15 and
+    // values within +-kSmallValueLimit.
     uint32_t ac[2][tekoj::kAcTableWords];
     tekoj::BlockKernel kernel;   // one block
     tekoj::McuKernel mcu_kernel;  // all blocks of an MCU, when room for all is certain

@@ -25,8 +25,8 @@ CoderKernels coder_kernels_for(int level) {
     switch (static_cast<SimdLevel>(level)) {
 #if defined(__x86_64__) || defined(__i386__)
         case SimdLevel::sse2: return coder_kernels_sse2();
-        case SimdLevel::avx2:
-        case SimdLevel::avx512: return coder_kernels_avx2();
+        case SimdLevel::avx2: return coder_kernels_avx2();
+        case SimdLevel::avx512: return coder_kernels_avx512();
 #elif defined(__arm__) || defined(__aarch64__)
         case SimdLevel::neon: return coder_kernels_neon();
 #endif

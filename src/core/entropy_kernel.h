@@ -16,6 +16,7 @@ namespace tekoj {
 // Per-target kernels; each exists only in builds for its processor.
 CoderKernels coder_kernels_sse2();
 CoderKernels coder_kernels_avx2();
+CoderKernels coder_kernels_avx512();
 CoderKernels coder_kernels_neon();
 
 namespace {
@@ -200,6 +201,8 @@ inline constexpr ScanOffsets kScanOffsets = make_scan_offsets();
         put_coded(w, dc[k], dc_diff, k);
     }
     const char* base = reinterpret_cast<const char*>(values);
+    // Without offsets the values are in zig-zag order already.
+    const uint8_t* order = offsets != nullptr ? offsets : kScanOffsets.zigzag;
     const uint32_t* ac_top = ac + 32;  // ac_top[16 * run - z]: the entry of category 32 - z
     const uint32_t* small = ac + 256;                          // see EkoCoderTables::ac
     auto code = [&](Count run, const uint8_t* at) __attribute__((always_inline)) {
@@ -208,11 +211,11 @@ inline constexpr ScanOffsets kScanOffsets = make_scan_offsets();
             run -= 16;
         }
         int16_t v;
-        std::memcpy(&v, base + *at, sizeof v);
+        std::memcpy(&v, base + (offsets != nullptr ? static_cast<Count>(*at) : 2 * (at - order)), sizeof v);
         // Small values (nearly all): code, extra bits and length in one entry.
         const uint32_t index = static_cast<uint32_t>(v + static_cast<int32_t>(kSmallValueLimit));
         if (__builtin_expect(index <= 2 * kSmallValueLimit, 1)) {
-            const uint32_t entry = small[run * 128 + static_cast<Count>(index)];
+            const uint32_t entry = small[run * kSmallRunStride + static_cast<Count>(index)];
             put(w, entry >> 5, static_cast<int>(entry & 31));
             return;
         }
@@ -239,10 +242,10 @@ inline constexpr ScanOffsets kScanOffsets = make_scan_offsets();
         Count last = 0;  // the DC position counts as coded
         auto small_entry = [&](Count run, Count p, uint32_t& entry) __attribute__((always_inline)) {
             int16_t v;
-            std::memcpy(&v, base + offsets[p], sizeof v);
+            std::memcpy(&v, base + (offsets != nullptr ? static_cast<Count>(offsets[p]) : 2 * p), sizeof v);
             const uint32_t index = static_cast<uint32_t>(v + static_cast<int32_t>(kSmallValueLimit));
             if (run > 15 || index > 2 * kSmallValueLimit) return false;
-            entry = small[run * 128 + static_cast<Count>(index)];
+            entry = small[run * kSmallRunStride + static_cast<Count>(index)];
             return true;
         };
         while (m != 0) {
@@ -250,7 +253,7 @@ inline constexpr ScanOffsets kScanOffsets = make_scan_offsets();
             m &= m - 1;
             uint32_t first;
             if (!small_entry(p - last - 1, p, first)) {
-                code(p - last - 1, offsets + p);
+                code(p - last - 1, order + p);
                 last = p;
                 continue;
             }
@@ -280,7 +283,7 @@ inline constexpr ScanOffsets kScanOffsets = make_scan_offsets();
             carry += kScanWordBits;
             continue;
         }
-        const uint8_t* at = offsets + h * kScanWordBits - 1;  // last position consumed
+        const uint8_t* at = order + h * kScanWordBits - 1;  // last position consumed
         Count r = first_set(m);
         m = skip_past(m, static_cast<int>(r));
         at += r + 1;
@@ -294,7 +297,7 @@ inline constexpr ScanOffsets kScanOffsets = make_scan_offsets();
             at += step;
             code(r, at);
         }
-        carry = offsets + (h + 1) * kScanWordBits - 1 - at;
+        carry = order + (h + 1) * kScanWordBits - 1 - at;
     }
     put(w, ac[0] >> 5, static_cast<int>(ac[0] & 31));  // EOB
     state = w;
