@@ -59,27 +59,15 @@ inline void write_byte(uint8_t*& out, uint32_t b) {
     }
 }
 
-// Appends the low `size` bits of `code` (nothing above them set); size is at
-// most 26.
-[[gnu::always_inline]] inline void put(BitState& w, uint32_t code, int size) {
+// Appends the low `size` bits of `code` (nothing above them set): at most 26
+// bits, or with a 64-bit code into a 64-bit word at most 52 (two codes).
+template <typename Code = uint32_t>
+[[gnu::always_inline]] inline void put(BitState& w, Code code, int size) {
     w.free -= size;
     if (__builtin_expect(w.free >= 0, 1)) {
         w.acc = (w.acc << size) | code;
     } else {
         // Fill the word, write it, keep the rest of the code.
-        w.acc = (w.acc << (size + w.free)) | (code >> -w.free);
-        flush_word(w);
-        w.acc = code;
-        w.free += kAccBits;
-    }
-}
-
-// Appends up to 52 bits to a 64-bit word, as put() does.
-[[gnu::always_inline]] inline void put_long(BitState& w, uint64_t code, int size) {
-    w.free -= size;
-    if (__builtin_expect(w.free >= 0, 1)) {
-        w.acc = (w.acc << size) | code;
-    } else {
         w.acc = (w.acc << (size + w.free)) | (code >> -w.free);
         flush_word(w);
         w.acc = code;
@@ -266,7 +254,7 @@ inline constexpr ScanOffsets kScanOffsets = make_scan_offsets();
             last = std::countr_zero(m);
             m &= m - 1;
             const int second_size = static_cast<int>(second & 31);
-            put_long(w, static_cast<uint64_t>(first >> 5) << second_size | (second >> 5),
+            put<uint64_t>(w, static_cast<uint64_t>(first >> 5) << second_size | (second >> 5),
                      static_cast<int>(first & 31) + second_size);
         }
         put(w, ac[0] >> 5, static_cast<int>(ac[0] & 31));  // EOB
