@@ -122,24 +122,6 @@ inline constexpr ScanWord scan_bit(int p) {
     return kScanFromTop ? ScanWord{1} << (kScanWordBits - 1 - b) : ScanWord{1} << b;
 }
 
-// Builds a ScanMap from a 64-bit bitmap with position p at bit p.
-inline ScanMap scan_map_from_bits(uint64_t bits) {
-    ScanMap m{};
-    if constexpr (kScanFromTop) {
-        for (int w = 0; w < kScanWords; ++w) {
-            uint32_t v = static_cast<uint32_t>(bits >> (32 * w));
-            // Bit reversal: position order from the top.
-            v = ((v >> 1) & 0x55555555u) | ((v & 0x55555555u) << 1);
-            v = ((v >> 2) & 0x33333333u) | ((v & 0x33333333u) << 2);
-            v = ((v >> 4) & 0x0F0F0F0Fu) | ((v & 0x0F0F0F0Fu) << 4);
-            m.word[w] = static_cast<ScanWord>(__builtin_bswap32(v));
-        }
-    } else {
-        m.word[0] = static_cast<ScanWord>(bits);
-    }
-    return m;
-}
-
 // Zeros before the first set bit in scan order, and the word with that bit
 // and everything before it consumed (two shifts: the count may be the
 // word's width less one).
@@ -176,7 +158,8 @@ inline constexpr ScanOffsets kScanOffsets = make_scan_offsets();
 
 // Codes a block: the DC difference, then the AC positions set in `map`
 // (positions 1..62 at most), limited to +-1023, then EOB. The value at
-// position p is the int16 at byte offset offsets[p] of `values`.
+// position p is the int16 at byte offset offsets[p] of `values`, or
+// values[p] when `offsets` is null (values already in zig-zag order).
 [[gnu::always_inline]] inline void code_block_from_map(BitState& state, int32_t dc_diff, const uint32_t* dc,
                                                       const uint32_t* ac, const ScanMap& map, const int16_t* values,
                                                       const uint8_t* offsets) {

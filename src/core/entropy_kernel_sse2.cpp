@@ -25,7 +25,7 @@ namespace {
         zeros |= static_cast<uint64_t>(static_cast<uint32_t>(_mm_movemask_epi8(z))) << (8 * r);
     }
     const uint64_t mask = ~zeros & 0x7FFFFFFFFFFFFFFEull;
-    code_block_from_map(bits, dc_diff, dc, ac, ScanMap{{mask}}, zz, kScanOffsets.zigzag);
+    code_block_from_map(bits, dc_diff, dc, ac, ScanMap{{mask}}, zz, nullptr);
 }
 
 }  // namespace
