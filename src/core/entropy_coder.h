@@ -63,7 +63,9 @@ namespace tekoj {
 // made room for blocks_in_mcu * kBlockWorstCase bytes.
 using McuKernel = void (*)(BitState& bits, const ::EkoCoderTables& tables, int16_t* const* blocks, int32_t* last_dc);
 
-// Words of one AC table in the coder's tables (see EkoCoderTables::ac).
+// Each AC table in the coder's tables (EkoCoderTables::ac): 256 symbol
+// entries, then a row of kSmallRunStride entries per run for the values
+// within +-kSmallValueLimit.
 inline constexpr uint32_t kSmallValueLimit = 63;
 inline constexpr uint32_t kSmallRunStride = 2 * kSmallValueLimit + 2;
 inline constexpr uint32_t kAcTableWords = 256 + 16 * kSmallRunStride;
